@@ -1,0 +1,206 @@
+// Stand-in for the disk, expansion-unit and USB services.
+//
+// DiskInfoEnum hands out every described disk, whatever the filter's mask:
+// the description says what the enumeration answers, and the mask is only
+// journalled.
+#include <cstddef>
+#include <cstring>
+#include <new>
+
+#include "standin_internal.h"
+
+using korvstandin::ExternalDeviceSet;
+using korvstandin::Fault;
+using korvstandin::Host;
+using korvstandin::Op;
+using korvstandin::detail::CopyText;
+using korvstandin::detail::Enter;
+using korvstandin::detail::Text;
+
+namespace {
+
+DiskInfoList *BuildDiskList()
+{
+    DiskInfoList *head = nullptr;
+    DiskInfoList **tail = &head;
+    for (const korvstandin::Disk &disk : Host().disks) {
+        auto *node = new DiskInfoList{};
+        if (!disk.recordMissing) {
+            node->disk = new DiskInfo{};
+            node->disk->diskNumber = disk.number;
+            node->disk->container = disk.container;
+            node->disk->groupIndex = disk.groupIndex;
+            CopyText(node->disk->devicePath, sizeof node->disk->devicePath, disk.devicePath);
+        }
+        *tail = node;
+        tail = &node->next;
+    }
+    if (head != nullptr)
+        korvstandin::detail::Allocated();
+    return head;
+}
+
+const char *ModelNameOf(const EBoxIdentity *identity)
+{
+    return identity == nullptr ? nullptr : identity->modelName;
+}
+
+// The stand-in keeps a unit's power state beside its record, keyed by address.
+struct StandinEBox {
+    EBoxInfo info;
+    bool poweredOn;
+};
+static_assert(offsetof(StandinEBox, info) == 0, "a unit record starts its stand-in node");
+
+EBoxInfo *BuildUnitList()
+{
+    EBoxInfo *head = nullptr;
+    EBoxInfo **tail = &head;
+    for (const korvstandin::ExpansionUnit &unit : Host().expansionUnits) {
+        auto *node = new StandinEBox{};
+        node->info.unitNumber = unit.number;
+        node->info.diskPaths = korvstandin::detail::NewSzList(unit.diskPaths);
+        if (unit.modelName) {
+            node->info.modelName = ModelNameOf;
+            CopyText(node->info.identity.modelName, sizeof node->info.identity.modelName,
+                     *unit.modelName);
+        }
+        node->poweredOn = unit.poweredOn;
+        *tail = &node->info;
+        tail = &node->info.next;
+    }
+    if (head != nullptr)
+        korvstandin::detail::Allocated();
+    return head;
+}
+
+const ExternalDeviceSet *DeviceSetOf(int kind)
+{
+    switch (kind) {
+    case EXTERNAL_USB_DEVICE:
+        return &Host().usb;
+    case EXTERNAL_ESATA_DEVICE:
+        return &Host().esata;
+    default:
+        return nullptr;
+    }
+}
+
+size_t DeviceListSize(const ExternalDeviceSet &set)
+{
+    size_t size = set.devices.size() * sizeof(char *);
+    for (const korvstandin::ExternalDevice &device : set.devices)
+        size += device.name.size() + 1;
+    return size;
+}
+
+}  // namespace
+
+extern "C" {
+
+int DiskInfoEnum(const DiskFilter *filter, DiskInfoList **head)
+{
+    Fault fault = Enter(Op::DiskInfoEnum, filter ? filter->containerMask : -1);
+    if (head == nullptr || fault == Fault::Fail)
+        return -1;
+    *head = BuildDiskList();
+    return fault == Fault::None ? 0 : -1;
+}
+
+void DiskInfoEnumFree(DiskInfoList *head)
+{
+    Enter(Op::DiskInfoEnumFree);
+    if (head == nullptr)
+        return;
+    korvstandin::detail::Released();
+    while (head != nullptr) {
+        DiskInfoList *next = head->next;
+        delete head->disk;
+        delete head;
+        head = next;
+    }
+}
+
+int SupportEBox(void)
+{
+    if (Enter(Op::SupportEBox) != Fault::None)
+        return 0;
+    return Host().supportsEBox ? 1 : 0;
+}
+
+int KORVEBoxInfoEnum(EBoxInfo **head)
+{
+    Fault fault = Enter(Op::KORVEBoxInfoEnum);
+    if (head == nullptr || fault == Fault::Fail)
+        return -1;
+    *head = BuildUnitList();
+    return fault == Fault::None ? 0 : -1;
+}
+
+void KORVEBoxInfoEnumFree(EBoxInfo *head)
+{
+    Enter(Op::KORVEBoxInfoEnumFree);
+    if (head == nullptr)
+        return;
+    korvstandin::detail::Released();
+    while (head != nullptr) {
+        EBoxInfo *next = head->next;
+        korvstandin::detail::FreeSzList(head->diskPaths);
+        delete reinterpret_cast<StandinEBox *>(head);
+        head = next;
+    }
+}
+
+int KORVEBoxIsPoweron(const EBoxInfo *unit)
+{
+    if (Enter(Op::KORVEBoxIsPoweron, unit ? unit->unitNumber : 0u) != Fault::None ||
+        unit == nullptr)
+        return 0;
+    return reinterpret_cast<const StandinEBox *>(unit)->poweredOn ? 1 : 0;
+}
+
+int KORVUSBDevEnum(int kind, char **names, int size, int *needed)
+{
+    if (Enter(Op::KORVUSBDevEnum, kind, names ? "buffer" : "(null)", size) != Fault::None)
+        return -1;
+    const ExternalDeviceSet *set = DeviceSetOf(kind);
+    if (set == nullptr)
+        return -1;
+    size_t listSize = DeviceListSize(*set);
+    if (names == nullptr) {
+        if (set->sizeQueryFails || needed == nullptr)
+            return -1;
+        *needed = static_cast<int>(listSize);
+        return 0;
+    }
+    if (set->fillFails || size < 0 || static_cast<size_t>(size) < listSize)
+        return -1;
+    char *text = reinterpret_cast<char *>(names + set->devices.size());
+    for (size_t i = 0; i < set->devices.size(); ++i) {
+        const std::string &name = set->devices[i].name;
+        std::memcpy(text, name.c_str(), name.size() + 1);
+        names[i] = text;
+        text += name.size() + 1;
+    }
+    return static_cast<int>(set->devices.size());
+}
+
+int KORVExtStgPartsVolInfoGet(const char *name, ExtStgPartsVolInfo *info, int isUsb)
+{
+    if (Enter(Op::KORVExtStgPartsVolInfoGet, Text(name), isUsb) != Fault::None ||
+        name == nullptr || info == nullptr)
+        return -1;
+    const ExternalDeviceSet *set = DeviceSetOf(isUsb ? EXTERNAL_USB_DEVICE : EXTERNAL_ESATA_DEVICE);
+    for (const korvstandin::ExternalDevice &device : set->devices) {
+        if (device.name != name)
+            continue;
+        if (device.infoFails)
+            return -1;
+        info->kind = isUsb ? EXTERNAL_USB_DEVICE : EXTERNAL_ESATA_DEVICE;
+        CopyText(info->displayName, sizeof info->displayName, device.displayText);
+        return 0;
+    }
+    return -1;
+}
+
+}  // extern "C"

@@ -1,0 +1,125 @@
+// Stand-in for the storage services.
+#include <cstring>
+
+#include "standin_internal.h"
+
+using korvstandin::Fault;
+using korvstandin::Host;
+using korvstandin::Op;
+using korvstandin::detail::CopyText;
+using korvstandin::detail::Enter;
+
+namespace {
+
+SpaceInfo *BuildSpaceList()
+{
+    SpaceInfo *head = nullptr;
+    SpaceInfo **tail = &head;
+    for (const korvstandin::Space &space : Host().spaces) {
+        auto *node = new SpaceInfo{};
+        CopyText(node->devicePath, sizeof node->devicePath, space.devicePath);
+        CopyText(node->name, sizeof node->name, space.name);
+        *tail = node;
+        tail = &node->next;
+    }
+    if (head != nullptr)
+        korvstandin::detail::Allocated();
+    return head;
+}
+
+char *Duplicate(const std::string &text)
+{
+    char *copy = new char[text.size() + 1];
+    std::memcpy(copy, text.c_str(), text.size() + 1);
+    return copy;
+}
+
+FlashCacheConfig *BuildFlashCacheList()
+{
+    FlashCacheConfig *head = nullptr;
+    FlashCacheConfig **tail = &head;
+    for (const korvstandin::FlashCache &cache : Host().flashCaches) {
+        auto *node = new FlashCacheConfig{};
+        node->spacePath = Duplicate(cache.spacePath);
+        node->volumePath = Duplicate(cache.volumePath);
+        *tail = node;
+        tail = &node->next;
+    }
+    if (head != nullptr)
+        korvstandin::detail::Allocated();
+    return head;
+}
+
+}  // namespace
+
+extern "C" {
+
+int KORVSpaceInfoEnum(int flags, SpaceInfo **list)
+{
+    Fault fault = Enter(Op::KORVSpaceInfoEnum, flags);
+    if (list == nullptr || fault == Fault::Fail)
+        return -1;
+    *list = BuildSpaceList();
+    return fault == Fault::None ? 0 : -1;
+}
+
+void KORVSpaceInfoFree(SpaceInfo *list)
+{
+    Enter(Op::KORVSpaceInfoFree);
+    if (list == nullptr)
+        return;
+    korvstandin::detail::Released();
+    while (list != nullptr) {
+        SpaceInfo *next = list->next;
+        delete list;
+        list = next;
+    }
+}
+
+int KORVFlashCacheConfigGet(int flags, FlashCacheConfig **list)
+{
+    Fault fault = Enter(Op::KORVFlashCacheConfigGet, flags);
+    if (list == nullptr || fault == Fault::Fail)
+        return -1;
+    *list = BuildFlashCacheList();
+    if (fault != Fault::None)
+        return -1;
+    return static_cast<int>(Host().flashCaches.size());
+}
+
+void KORVFlashCacheConfigFree(FlashCacheConfig *list)
+{
+    Enter(Op::KORVFlashCacheConfigFree);
+    if (list == nullptr)
+        return;
+    korvstandin::detail::Released();
+    while (list != nullptr) {
+        FlashCacheConfig *next = list->next;
+        delete[] list->spacePath;
+        delete[] list->volumePath;
+        delete list;
+        list = next;
+    }
+}
+
+int KORVVSpaceLayerPathGet(int flags, const SpaceLayerRef *ref, char *buffer, int size)
+{
+    const char *volumePath = ref && ref->volumePath ? ref->volumePath : "(null)";
+    const char *spacePath = ref && ref->spacePath ? ref->spacePath : "(null)";
+    if (Enter(Op::KORVVSpaceLayerPathGet, flags, volumePath, spacePath, size) != Fault::None)
+        return -1;
+    if (ref == nullptr || ref->volumePath == nullptr || ref->spacePath == nullptr ||
+        buffer == nullptr || size <= 0)
+        return -1;
+    for (const korvstandin::FlashCache &cache : Host().flashCaches) {
+        if (cache.volumePath != ref->volumePath || cache.spacePath != ref->spacePath)
+            continue;
+        if (cache.layerFails)
+            return -1;
+        CopyText(buffer, static_cast<size_t>(size), cache.layerPath);
+        return 0;
+    }
+    return -1;
+}
+
+}  // extern "C"

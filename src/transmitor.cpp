@@ -1,0 +1,290 @@
+// The collector client object: request and reply frames, whole exchanges,
+// and the collector control requests.
+#include <arpa/inet.h>
+#include <sys/select.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cstdint>
+#include <cstring>
+
+#include <json/reader.h>
+#include <json/writer.h>
+
+#include "korvsnmp/transmitor.h"
+#include "log.h"
+
+namespace {
+
+constexpr char kLogUnit[] = "transmitor";
+
+constexpr timeval kWritableWait = {10, 500000};
+constexpr timeval kReadableWait = {90, 0};
+constexpr size_t kLengthPrefixSize = 4;
+constexpr size_t kReplyReadSize = 1024;
+
+constexpr char kControlHostName[] = "localhost";
+
+// Closes the connection that `fd` holds, if any, and marks it closed.
+void CloseConnection(int &fd)
+{
+    if (fd != -1) {
+        close(fd);
+        fd = -1;
+    }
+}
+
+// select() watches descriptors below FD_SETSIZE only: FD_SET on a higher one
+// would write past the set.
+bool FitsSelect(int fd)
+{
+    if (fd < FD_SETSIZE)
+        return true;
+    KORVSNMP_LOG(LOG_ERR, "socket descriptor %d is beyond select()'s limit of %d", fd,
+                 FD_SETSIZE);
+    return false;
+}
+
+enum class Readiness { Readable, Writable };
+
+// Waits at most `wait` for `fd` (0 <= fd < FD_SETSIZE) to become ready.
+// Returns select()'s result; `marked` tells whether `fd` came back marked.
+int WaitFor(int fd, Readiness readiness, timeval wait, bool &marked)
+{
+    fd_set set;
+    FD_ZERO(&set);
+    FD_SET(fd, &set);
+    fd_set *readSet = readiness == Readiness::Readable ? &set : nullptr;
+    fd_set *writeSet = readiness == Readiness::Writable ? &set : nullptr;
+    int result = select(fd + 1, readSet, writeSet, nullptr, &wait);
+    marked = result > 0 && FD_ISSET(fd, &set);
+    return result;
+}
+
+// Writes all `size` bytes with one call. The collector may have gone away:
+// MSG_NOSIGNAL turns the SIGPIPE that would end the caller into an error.
+bool SendWhole(int fd, const void *data, size_t size)
+{
+    return send(fd, data, size, MSG_NOSIGNAL) == static_cast<ssize_t>(size);
+}
+
+// A one-line rendering of a value, for log messages.
+std::string ToText(const Json::Value &value)
+{
+    std::string text = Json::FastWriter().write(value);
+    if (!text.empty() && text.back() == '\n')
+        text.pop_back();
+    return text;
+}
+
+bool IsSuccessReply(const Json::Value &reply)
+{
+    if (!reply.isObject())
+        return false;
+    const Json::Value &success = reply["success"];
+    return success.isBool() && success.asBool();
+}
+
+// Runs one control exchange on a Transmitor of its own and judges the reply.
+bool SendControlRequest(const Json::Value &request)
+{
+    Json::Value reply(Json::objectValue);
+    Transmitor transmitor(kControlHostName);
+
+    if (transmitor.Transmit(request) == -1) {
+        KORVSNMP_LOG(LOG_ERR, "Failed to send request to korvsnmpcd, request: [%s]",
+                     ToText(request).c_str());
+        return false;
+    }
+    if (transmitor.GetDataJson(reply) == -1) {
+        KORVSNMP_LOG(LOG_ERR, "Failed to get response from korvsnmpcd, request: [%s]",
+                     ToText(request).c_str());
+        return false;
+    }
+    if (IsSuccessReply(reply))
+        return true;
+    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]", ToText(request).c_str(),
+                 ToText(reply).c_str());
+    return false;
+}
+
+}  // namespace
+
+Transmitor::Transmitor(const std::string &name) : hostName(name), dataStr(), socketFd(-1) {}
+
+Transmitor::~Transmitor() { CloseConnection(socketFd); }
+
+int Transmitor::SetHostName(const std::string &name)
+{
+    if (name.empty()) {
+        KORVSNMP_LOG(LOG_ERR, "Error: Wrong parameter");
+        return -1;
+    }
+    hostName = name;
+    return 0;
+}
+
+int Transmitor::Transmit(const Json::Value &request)
+{
+    if (hostName.empty()) {
+        KORVSNMP_LOG(LOG_ERR, "wrong parameter");
+        CloseConnection(socketFd);
+        return -1;
+    }
+
+    CloseConnection(socketFd);  // never leak a connection that a caller left open
+    socketFd = SocketInit();
+    if (socketFd < 0) {
+        socketFd = -1;
+        return -1;
+    }
+    if (TransmitData(request) < 0) {
+        KORVSNMP_LOG(LOG_ERR, "Error: cannot transmit the data");
+        CloseConnection(socketFd);
+        return -1;
+    }
+    if (ReceiveData() < 0) {
+        KORVSNMP_LOG(LOG_ERR, "Error: cannot received the data");
+        CloseConnection(socketFd);
+        return -1;
+    }
+    CloseConnection(socketFd);
+    return 0;
+}
+
+int Transmitor::GetDataStr(std::string &text) const
+{
+    if (dataStr.empty()) {
+        KORVSNMP_LOG(LOG_ERR, "Error: wrong member data inside");
+        return -1;
+    }
+    text = dataStr;
+    return 0;
+}
+
+int Transmitor::GetDataJson(Json::Value &value) const
+{
+    Json::Reader reader;
+    if (dataStr.empty()) {
+        KORVSNMP_LOG(LOG_ERR, "Error: wrong member data inside");
+        return -1;
+    }
+    std::string errors;
+    try {
+        if (reader.parse(dataStr, value, true))
+            return 0;
+        errors = reader.getFormattedErrorMessages();
+    } catch (const Json::Exception &error) {
+        // The reader gives up on very deep nesting by throwing.
+        errors = error.what();
+    }
+    KORVSNMP_LOG(LOG_ERR, "Error: cannot convert the string to json format %s", errors.c_str());
+    return -1;
+}
+
+int Transmitor::TransmitData(const Json::Value &request)
+{
+    if (socketFd < 0) {
+        KORVSNMP_LOG(LOG_ERR, "Bad parameter");
+        return -1;
+    }
+    if (!FitsSelect(socketFd)) {
+        CloseConnection(socketFd);
+        return -1;
+    }
+
+    bool writable = false;
+    int ready = WaitFor(socketFd, Readiness::Writable, kWritableWait, writable);
+    if (ready <= 0) {
+        KORVSNMP_LOG(LOG_ERR, "select() failed. ret=[%d]", ready);
+        CloseConnection(socketFd);
+        return -1;
+    }
+    if (!writable) {
+        KORVSNMP_LOG(LOG_ERR, "socket is unwritable");
+        CloseConnection(socketFd);
+        return -1;
+    }
+
+    // The frame carries the text and its NUL; the writer's line feed is part of the text.
+    const std::string text = Json::FastWriter().write(request);
+    const uint32_t frameLength = static_cast<uint32_t>(std::strlen(text.c_str()) + 1);
+    const uint32_t prefix = htonl(frameLength);
+    if (!SendWhole(socketFd, &prefix, kLengthPrefixSize) ||
+        !SendWhole(socketFd, text.c_str(), frameLength)) {
+        KORVSNMP_LOG(LOG_ERR, "Failed to send command.");
+        CloseConnection(socketFd);
+        return -1;
+    }
+    return 0;
+}
+
+int Transmitor::ReceiveData()
+{
+    if (socketFd < 0) {
+        KORVSNMP_LOG(LOG_ERR, "Bad parameter");
+        return -1;
+    }
+    if (!FitsSelect(socketFd)) {
+        CloseConnection(socketFd);
+        return -1;
+    }
+
+    bool readable = false;
+    int ready = WaitFor(socketFd, Readiness::Readable, kReadableWait, readable);
+    if (ready < 0) {
+        KORVSNMP_LOG(LOG_ERR, "select() failed. ret=[%d]", ready);
+        CloseConnection(socketFd);
+        return -1;
+    }
+    if (ready == 0) {  // the collector kept silent for the whole wait
+        CloseConnection(socketFd);
+        return -1;
+    }
+
+    dataStr.clear();
+    unsigned char prefix[kLengthPrefixSize];
+    if (read(socketFd, prefix, sizeof prefix) != static_cast<ssize_t>(sizeof prefix)) {
+        KORVSNMP_LOG(LOG_ERR, "client Failed to read action");
+        CloseConnection(socketFd);
+        return -1;
+    }
+    uint32_t networkLength;
+    std::memcpy(&networkLength, prefix, sizeof networkLength);
+    const int32_t length = static_cast<int32_t>(ntohl(networkLength));
+    if (length <= 0)  // no body
+        return 0;
+
+    // Every read asks for a whole piece: bytes that arrive beyond the length
+    // in the same burst are kept too.
+    char piece[kReplyReadSize];
+    int64_t missing = length;
+    while (missing > 0) {
+        ssize_t received = read(socketFd, piece, sizeof piece);
+        if (received <= 0) {
+            KORVSNMP_LOG(LOG_ERR, "client Failed to read the reply body, %lld of %d bytes missing",
+                         static_cast<long long>(missing), length);
+            dataStr.clear();  // never hand out half a reply
+            CloseConnection(socketFd);
+            return -1;
+        }
+        dataStr.append(piece, static_cast<size_t>(received));
+        missing -= received;
+    }
+    return 0;
+}
+
+bool Transmitor::EnterHistoryMode(std::string reason)
+{
+    Json::Value request(Json::objectValue);
+    request["request"] = "history_mode";
+    request["reason"] = reason;
+    return SendControlRequest(request);
+}
+
+bool Transmitor::Reload()
+{
+    Json::Value request(Json::objectValue);
+    request["request"] = "reload";
+    return SendControlRequest(request);
+}
