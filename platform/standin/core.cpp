@@ -21,19 +21,9 @@ struct KLIBCSzHash {
 
 namespace korvstandin::detail {
 
-KLIBCSzList *NewSzList(const std::vector<std::string> &items)
-{
-    Allocated();
-    return new KLIBCSzList{items};
-}
+KLIBCSzList *NewSzList(const std::vector<std::string> &items) { return new KLIBCSzList{items}; }
 
-void FreeSzList(KLIBCSzList *list)
-{
-    if (list == nullptr)
-        return;
-    Released();
-    delete list;
-}
+void FreeSzList(KLIBCSzList *list) { delete list; }
 
 }  // namespace korvstandin::detail
 

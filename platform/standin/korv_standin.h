@@ -28,25 +28,25 @@ struct Disk {
     int number = 0;
     int container = DISK_CONTAINER_INTERNAL;
     int groupIndex = 0;
-    std::string devicePath;      // cut to fit DiskInfo::devicePath
+    std::string devicePath{};      // cut to fit DiskInfo::devicePath
     bool recordMissing = false;  // the list node carries no disk record
 };
 
 struct ExpansionUnit {
     unsigned int number = 0;
-    std::vector<std::string> diskPaths;
-    std::optional<std::string> modelName;  // none: the unit has no model-name operation
+    std::vector<std::string> diskPaths{};
+    std::optional<std::string> modelName{};  // none: the unit has no model-name operation
     bool poweredOn = true;
 };
 
 struct ExternalDevice {
-    std::string name;         // as KORVUSBDevEnum lists it
-    std::string displayText;  // cut to fit ExtStgPartsVolInfo::displayName
+    std::string name{};         // as KORVUSBDevEnum lists it
+    std::string displayText{};  // cut to fit ExtStgPartsVolInfo::displayName
     bool infoFails = false;   // KORVExtStgPartsVolInfoGet fails for it
 };
 
 struct ExternalDeviceSet {
-    std::vector<ExternalDevice> devices;
+    std::vector<ExternalDevice> devices{};
     bool sizeQueryFails = false;  // KORVUSBDevEnum's size query fails for this kind
     bool fillFails = false;       // its filling call fails for this kind
 };
@@ -54,32 +54,32 @@ struct ExternalDeviceSet {
 enum class NetRole { Plain, Vlan, Aggregation, OvsMaster };
 
 struct NetInterface {
-    std::string name;
+    std::string name{};
     NetRole role = NetRole::Plain;
-    std::string vlanParent;             // Vlan: the carrying interface
-    std::string vlanName;               // Vlan: the name the VLAN record lists
-    std::vector<std::string> members;   // Aggregation: member names, in slot order
-    std::optional<int> memberCountClaim;// Aggregation: count written instead of members.size()
+    std::string vlanParent{};             // Vlan: the carrying interface
+    std::string vlanName{};               // Vlan: the name the VLAN record lists
+    std::vector<std::string> members{};   // Aggregation: member names, in slot order
+    std::optional<int> memberCountClaim{};  // Aggregation: count written instead of members.size()
     int ovsMasterAnswer = 1;            // OvsMaster: KLIBNetOVSIfIsMaster's nonzero answer
     bool vlanQueryFails = false;        // KLIBNetVlanGet answers -1 for it
     bool aggrQueryFails = false;        // KORVNetLinkAggrGet answers -1 for it
 };
 
 struct Space {
-    std::string devicePath;
-    std::string name;
+    std::string devicePath{};
+    std::string name{};
 };
 
 struct FlashCache {
-    std::string spacePath;
-    std::string volumePath;
-    std::string layerPath;     // what KORVVSpaceLayerPathGet answers for this cache
+    std::string spacePath{};
+    std::string volumePath{};
+    std::string layerPath{};     // what KORVVSpaceLayerPathGet answers for this cache
     bool layerFails = false;   // KORVVSpaceLayerPathGet fails for it
 };
 
 struct Lun {
-    Json::Value uuid;  // normally strings; other types make malformed LUN objects
-    Json::Value name;  // a null member is left out of the LUN object
+    Json::Value uuid{};  // normally strings; other types make malformed LUN objects
+    Json::Value name{};  // a null member is left out of the LUN object
 };
 
 // How the web API answers "list" of "KORV.Core.ISCSI.LUN".
@@ -93,21 +93,21 @@ struct HostDescription {
     bool quillbox = false;
 
     bool supportsEBox = false;
-    std::vector<Disk> disks;
-    std::vector<ExpansionUnit> expansionUnits;
-    ExternalDeviceSet usb;
-    ExternalDeviceSet esata;
+    std::vector<Disk> disks{};
+    std::vector<ExpansionUnit> expansionUnits{};
+    ExternalDeviceSet usb{};
+    ExternalDeviceSet esata{};
 
-    std::vector<NetInterface> interfaces;
-    std::string pppoeInterface;  // empty: no PPPoE link
+    std::vector<NetInterface> interfaces{};
+    std::string pppoeInterface{};  // empty: no PPPoE link
 
-    std::vector<Space> spaces;
-    std::vector<FlashCache> flashCaches;
+    std::vector<Space> spaces{};
+    std::vector<FlashCache> flashCaches{};
 
-    std::vector<Lun> luns;
+    std::vector<Lun> luns{};
     LunAnswer lunAnswer = LunAnswer::Normal;
 
-    std::map<std::string, SectionedFile> files;  // by path; a missing path is an absent file
+    std::map<std::string, SectionedFile> files{};  // by path; a missing path is an absent file
 };
 
 // ---- Operations, fault switches and observation -----------------------------

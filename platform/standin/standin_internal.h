@@ -42,7 +42,7 @@ void Released();
 // Copies `text` into `buffer` of `size` bytes, cut to fit and NUL-terminated.
 void CopyText(char *buffer, size_t size, const std::string &text);
 
-// String lists, for the records that carry one.
+// String lists, for the records that carry one; released with their record.
 KLIBCSzList *NewSzList(const std::vector<std::string> &items);
 void FreeSzList(KLIBCSzList *list);
 
