@@ -49,7 +49,7 @@ bool RecordsAreReadable(const Json::Value &lunIO)
 // number or null reads as false.
 bool ReadsTrue(const Json::Value &value)
 {
-    return (value.isNumeric() || value.isNull()) && value.asBool();
+    return (value.isBool() || value.isNumeric() || value.isNull()) && value.asBool();
 }
 
 bool IsStringMember(const Json::Value &object, const char *key)
