@@ -74,6 +74,8 @@ bool GetBlockDevLink(const char *path, LinkTarget &target)
                   static_cast<unsigned long long>(major(status.st_rdev)),
                   static_cast<unsigned long long>(minor(status.st_rdev)));
 
+    // readlink() writes no terminator: the last byte stays zero, also for a
+    // target that fills the buffer (which is then cut).
     target.fill('\0');
     return readlink(linkPath, target.data(), target.size() - 1) >= 1;
 }
@@ -85,6 +87,8 @@ std::string KernelName(const char *path)
     LinkTarget target;
     if (!GetBlockDevLink(path, target))
         return std::string();
+    // GNU basename() from <cstring>: the text after the last '/'; it leaves
+    // its argument alone (libgen.h's variant must not be included here).
     return basename(target.data());
 }
 

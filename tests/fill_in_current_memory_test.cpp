@@ -42,36 +42,23 @@ TEST_F(MemoryTest, MemorySizeComesFromThePlatformElseFromTotalReal)
         unsigned int expected;
     } cases[] = {
         {0, R"({"total_real": 2048000})", 2048000},
-        {8388608, R"({"total_real": 2048000})", 8388608},
-        {4096, R"({"total_real": 2048000, "memory_size": 7})", 4096},
-        {0, R"({"total_real": 5, "memory_size": "x"})", 5},
+        {8388608, R"({"total_real": 2048000, "memory_size": 7})", 8388608},
+        {16, R"({"total_real": 1, "memory_size": "x", "unknown": {"a": [1, "b"]}, "s": "t"})", 16},
     };
+    korvstandin::SetJournal(true);
     for (const Case &c : cases) {
         SCOPED_TRACE(c.record);
         korvstandin::Host().physMemSize = c.platform;
-        Json::Value memory;
+        Json::Value memory = Parse(R"({"stale": true})");
         ASSERT_TRUE(KORVSNMP::FillInCurrentMemory(Parse(c.record), memory));
         Json::Value expected = Parse(c.record);
         expected["memory_size"] = c.expected;
         EXPECT_EQ(memory, expected) << memory.toStyledString();
     }
+    EXPECT_THAT(korvstandin::Journal(), ElementsAre("KLIBSystemPhysMemSizeGet()",
+                                                    "KLIBSystemPhysMemSizeGet()",
+                                                    "KLIBSystemPhysMemSizeGet()"));
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
-}
-
-TEST_F(MemoryTest, EveryOtherMemberPassesUnchanged)
-{
-    korvstandin::Host().physMemSize = 16;
-    const Json::Value record =
-        Parse(R"({"total_real": 1, "avail_real": 2, "unknown": {"a": [1, "b"]}, "s": "t"})");
-    Json::Value memory(Json::objectValue);
-    memory["stale"] = true;
-    ASSERT_TRUE(KORVSNMP::FillInCurrentMemory(record, memory));
-    Json::Value expected = record;
-    expected["memory_size"] = 16u;
-    EXPECT_EQ(memory, expected) << memory.toStyledString();
-    korvstandin::SetJournal(true);
-    ASSERT_TRUE(KORVSNMP::FillInCurrentMemory(record, memory));
-    EXPECT_THAT(korvstandin::Journal(), ElementsAre("KLIBSystemPhysMemSizeGet()"));
 }
 
 TEST_F(MemoryTest, RecordWithoutTotalRealIsCopiedAndFails)
@@ -92,12 +79,10 @@ TEST_F(MemoryTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
         const char *message;
     } cases[] = {
         {R"([{"total_real": 1}])", "Memory record is not an object"},
-        {R"("total_real")", "Memory record is not an object"},
         {R"({"total_real": "2048"})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
         {R"({"total_real": -1})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
         {R"({"total_real": 4294967296})",
          R"(Memory: "total_real" is not an unsigned 32-bit number)"},
-        {R"({"total_real": {}})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.record);

@@ -74,7 +74,8 @@ TEST_F(SpaceIOTest, UnreadableInputFailsAndLeavesTheSectionUntouched)
         {R"({"device": "total"})", "SpaceIO is not array."},
         {R"("total")", "SpaceIO is not array."},
         {R"([{"device": "total"}, 3])", "SpaceIO element 1 is not an object"},
-        {R"([{"device": "total"}, {"device": 7}])", R"(SpaceIO element 1: "device" is not a string)"},
+        {R"([{"device": "total"}, {"device": 7}])",
+         R"(SpaceIO element 1: "device" is not a string)"},
         {R"([{"device": ["sda"]}])", R"(SpaceIO element 0: "device" is not a string)"},
     };
     for (const Case &c : cases) {
@@ -293,7 +294,8 @@ TEST_F(SpaceIONodeTest, UnresolvedCachesLeaveTheirSpacesNamed)
 TEST_F(SpaceIONodeTest, OverlongLinkTargetIsCutAndTerminated)
 {
     constexpr int kRefused = 77;
-    const std::string target = "../" + std::string(1000, 'd') + "/abcdefghijklmnopqrstuvwxyz0123456789";
+    const std::string target =
+        "../" + std::string(1000, 'd') + "/abcdefghijklmnopqrstuvwxyz0123456789";
     const std::string kept = target.substr(0, 1023);
     const std::string key = kept.substr(kept.rfind('/') + 1);
     korvstandin::Host().spaces = {{Node(0), "long link"}};
