@@ -1,0 +1,139 @@
+// The iSCSI LUN section: records renamed from "device" to "uuid" and
+// "lun_name", with names from the web API's LUN list.
+#include <syslog.h>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <json/reader.h>
+
+#include "korv_standin.h"
+#include "korvsnmp/fill_in_current_lun_io.h"
+#include "syslog_capture.h"
+
+namespace {
+
+using korvstandin::LunAnswer;
+using korvstandin::Op;
+using korvtest::Logged;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+constexpr char kUnit[] = "fill_in_current_lun_io";
+constexpr char kLunListCall[] = "KORV::APIRunner::Exec(KORV.Core.ISCSI.LUN, 1, list, null, admin)";
+
+Json::Value Parse(const char *text)
+{
+    Json::Value value;
+    EXPECT_TRUE(Json::Reader().parse(text, value)) << text;
+    return value;
+}
+
+class LunIOTest : public ::testing::Test {
+protected:
+    void SetUp() override
+    {
+        korvstandin::Reset();
+        korvtest::ClearLog();
+        korvstandin::SetJournal(true);
+    }
+
+    // Runs the rewrite on `lunIO` and expects it to succeed with `expected`.
+    static void ExpectRewritten(const char *lunIO, const char *expected)
+    {
+        Json::Value records = Parse(lunIO);
+        EXPECT_TRUE(KORVSNMP::FillInCurrentLunIO(records));
+        EXPECT_EQ(records, Parse(expected)) << records.toStyledString();
+    }
+};
+
+TEST_F(LunIOTest, RecordsAreNamedFromTheLunList)
+{
+    korvstandin::Host().luns = {{"u-1", "first"},   {"u-2", "old"}, {"u-2", "second"},
+                                {"u-3", 7},         {5, "five"},    {"u-4", Json::Value()},
+                                {Json::Value(), "orphan"}};
+    ExpectRewritten(R"([
+        {"device": "u-2", "read": 1, "uuid": "stale", "lun_name": "stale"},
+        {"device": "u-1", "write": 2},
+        {"device": "u-3"},
+        {"device": "5"},
+        {"device": "u-4"},
+        {"device": "unknown"}])",
+                    R"([
+        {"uuid": "u-2", "lun_name": "second", "read": 1},
+        {"uuid": "u-1", "lun_name": "first", "write": 2},
+        {"uuid": "u-3", "lun_name": "u-3"},
+        {"uuid": "5", "lun_name": "5"},
+        {"uuid": "u-4", "lun_name": "u-4"},
+        {"uuid": "unknown", "lun_name": "unknown"}])");
+    EXPECT_THAT(korvstandin::Journal(), ElementsAre(kLunListCall));
+    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
+}
+
+TEST_F(LunIOTest, RecordWithoutDeviceGetsTheEmptyText)
+{
+    ExpectRewritten(R"([{"read": 1}, null])",
+                    R"([{"uuid": "", "lun_name": "", "read": 1}, {"uuid": "", "lun_name": ""}])");
+    korvstandin::Host().luns = {{"", "nameless"}};
+    ExpectRewritten(R"([{"read": 1}])", R"([{"uuid": "", "lun_name": "nameless", "read": 1}])");
+}
+
+TEST_F(LunIOTest, UnusableAnswerLeavesTheUuidAsName)
+{
+    struct Case {
+        LunAnswer answer;
+        bool execFails;
+        const char *message;
+    } cases[] = {
+        {LunAnswer::Unsuccessful, false, "Failed to list LUNs"},
+        {LunAnswer::Normal, true, "Failed to list LUNs"},
+        {LunAnswer::WithoutData, false, "LUNs json data not found"},
+        {LunAnswer::WithoutLuns, false, "LUNs json data not found"},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.message);
+        korvstandin::Reset();
+        korvstandin::SetJournal(true);
+        korvtest::ClearLog();
+        korvstandin::Host().luns = {{"u-1", "first"}};
+        korvstandin::Host().lunAnswer = c.answer;
+        if (c.execFails)
+            korvstandin::SetFault(Op::APIRunnerExec);
+        ExpectRewritten(R"([{"device": "u-1", "read": 3}])",
+                        R"([{"uuid": "u-1", "lun_name": "u-1", "read": 3}])");
+        EXPECT_THAT(korvstandin::Journal(), ElementsAre(kLunListCall));
+        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
+    }
+}
+
+TEST_F(LunIOTest, EmptyArrayAsksNothing)
+{
+    ExpectRewritten("[]", "[]");
+    EXPECT_EQ(korvstandin::CallCount(Op::APIRunnerExec), 0);
+    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
+}
+
+TEST_F(LunIOTest, UnreadableInputFailsAndStaysUntouched)
+{
+    struct Case {
+        const char *lunIO;
+        const char *message;
+    } cases[] = {
+        {R"({"device": "u-1"})", "LunIO is not array."},
+        {"null", "LunIO is not array."},
+        {R"([{"device": "u-1"}, "u-2"])", "LunIO element 1 is not an object"},
+        {R"([{"device": "u-1"}, {"device": 7}])", R"(LunIO element 1: "device" is not a string)"},
+        {R"([{"device": {"uuid": "u-1"}}])", R"(LunIO element 0: "device" is not a string)"},
+        {R"([{"device": null}])", R"(LunIO element 0: "device" is not a string)"},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.lunIO);
+        korvtest::ClearLog();
+        Json::Value lunIO = Parse(c.lunIO);
+        EXPECT_FALSE(KORVSNMP::FillInCurrentLunIO(lunIO));
+        EXPECT_EQ(lunIO, Parse(c.lunIO));
+        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
+    }
+    EXPECT_EQ(korvstandin::CallCount(Op::APIRunnerExec), 0);
+}
+
+}  // namespace

@@ -1,0 +1,97 @@
+// The memory section: the collector's record passed through, with the
+// platform's physical memory size as "memory_size".
+#include <syslog.h>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <json/reader.h>
+
+#include "korv_standin.h"
+#include "korvsnmp/fill_in_current_memory.h"
+#include "syslog_capture.h"
+
+namespace {
+
+using korvtest::Logged;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+constexpr char kUnit[] = "fill_in_current_memory";
+
+Json::Value Parse(const char *text)
+{
+    Json::Value value;
+    EXPECT_TRUE(Json::Reader().parse(text, value)) << text;
+    return value;
+}
+
+class MemoryTest : public ::testing::Test {
+protected:
+    void SetUp() override
+    {
+        korvstandin::Reset();
+        korvtest::ClearLog();
+    }
+};
+
+TEST_F(MemoryTest, MemorySizeComesFromThePlatformElseFromTotalReal)
+{
+    struct Case {
+        unsigned int platform;
+        const char *record;
+        unsigned int expected;
+    } cases[] = {
+        {0, R"({"total_real": 2048000})", 2048000},
+        {8388608, R"({"total_real": 2048000, "memory_size": 7})", 8388608},
+        {16, R"({"total_real": 1, "memory_size": "x", "unknown": {"a": [1, "b"]}, "s": "t"})", 16},
+    };
+    korvstandin::SetJournal(true);
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.record);
+        korvstandin::Host().physMemSize = c.platform;
+        Json::Value memory = Parse(R"({"stale": true})");
+        ASSERT_TRUE(KORVSNMP::FillInCurrentMemory(Parse(c.record), memory));
+        Json::Value expected = Parse(c.record);
+        expected["memory_size"] = c.expected;
+        EXPECT_EQ(memory, expected) << memory.toStyledString();
+    }
+    EXPECT_THAT(korvstandin::Journal(), ElementsAre("KLIBSystemPhysMemSizeGet()",
+                                                    "KLIBSystemPhysMemSizeGet()",
+                                                    "KLIBSystemPhysMemSizeGet()"));
+    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
+}
+
+TEST_F(MemoryTest, RecordWithoutTotalRealIsCopiedAndFails)
+{
+    korvstandin::Host().physMemSize = 16;
+    const Json::Value record = Parse(R"({"avail_real": 2, "memory_size": 3})");
+    Json::Value memory;
+    EXPECT_FALSE(KORVSNMP::FillInCurrentMemory(record, memory));
+    EXPECT_EQ(memory, record);
+    EXPECT_THAT(korvtest::LoggedMessages(),
+                ElementsAre(Logged(LOG_ERR, kUnit, "Memory TotalReal not exist.")));
+}
+
+TEST_F(MemoryTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
+{
+    struct Case {
+        const char *record;
+        const char *message;
+    } cases[] = {
+        {R"([{"total_real": 1}])", "Memory record is not an object"},
+        {R"({"total_real": "2048"})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
+        {R"({"total_real": -1})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
+        {R"({"total_real": 4294967296})",
+         R"(Memory: "total_real" is not an unsigned 32-bit number)"},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.record);
+        korvtest::ClearLog();
+        Json::Value memory = Parse(R"({"earlier": 1})");
+        EXPECT_FALSE(KORVSNMP::FillInCurrentMemory(Parse(c.record), memory));
+        EXPECT_EQ(memory, Parse(R"({"earlier": 1})"));
+        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
+    }
+}
+
+}  // namespace

@@ -1,0 +1,328 @@
+// The space section. Device nodes are real: the tests make block-device nodes
+// for devices that the running kernel has, so that their kernel names come
+// back through the real links under /sys/dev/block.
+#include <dirent.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <json/reader.h>
+
+#include "korv_standin.h"
+#include "korvsnmp/fill_in_current_space_io.h"
+#include "syslog_capture.h"
+
+namespace {
+
+using korvstandin::Fault;
+using korvstandin::Op;
+using korvtest::Logged;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+constexpr char kUnit[] = "fill_in_current_space_io";
+constexpr char kSysBlock[] = "/sys/dev/block";
+constexpr size_t kNodesNeeded = 5;
+
+Json::Value Parse(const std::string &text)
+{
+    Json::Value value;
+    EXPECT_TRUE(Json::Reader().parse(text, value)) << text;
+    return value;
+}
+
+class SpaceIOTest : public ::testing::Test {
+protected:
+    void SetUp() override
+    {
+        korvstandin::Reset();
+        korvtest::ClearLog();
+    }
+
+    // Runs the fill-in on `spaceIO` over a `space` holding "earlier"; expects
+    // the result `succeeds` and no platform list left unreleased.
+    static Json::Value Fill(const Json::Value &spaceIO, bool succeeds = true)
+    {
+        Json::Value space = Parse(R"({"earlier": 1})");
+        EXPECT_EQ(KORVSNMP::FillInCurrentSpaceIO(spaceIO, space), succeeds);
+        EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
+        return space;
+    }
+};
+
+TEST_F(SpaceIOTest, UnreadableInputFailsAndLeavesTheSectionUntouched)
+{
+    korvstandin::Host().spaces = {{"/dev/none", "vol"}};
+    struct Case {
+        const char *spaceIO;
+        const char *message;
+    } cases[] = {
+        {R"({"device": "total"})", "SpaceIO is not array."},
+        {R"("total")", "SpaceIO is not array."},
+        {R"([{"device": "total"}, 3])", "SpaceIO element 1 is not an object"},
+        {R"([{"device": "total"}, {"device": 7}])",
+         R"(SpaceIO element 1: "device" is not a string)"},
+        {R"([{"device": ["sda"]}])", R"(SpaceIO element 0: "device" is not a string)"},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.spaceIO);
+        korvtest::ClearLog();
+        EXPECT_EQ(Fill(Parse(c.spaceIO), false), Parse(R"({"earlier": 1})"));
+        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
+    }
+}
+
+TEST_F(SpaceIOTest, FailedSpaceEnumerationFailsEvenForAnEmptySection)
+{
+    korvstandin::Host().spaces = {{"/dev/none", "vol"}};
+    for (Fault fault : {Fault::Fail, Fault::FailLeavingList}) {
+        korvtest::ClearLog();
+        korvstandin::SetFault(Op::KORVSpaceInfoEnum, fault);
+        EXPECT_EQ(Fill(Json::Value(Json::arrayValue), false), Parse(R"({"earlier": 1})"));
+        EXPECT_THAT(korvtest::LoggedMessages(),
+                    ElementsAre(Logged(LOG_ERR, kUnit, "Failed to enum space info")));
+    }
+}
+
+TEST_F(SpaceIOTest, EmptySectionGivesAnEmptyVolumeList)
+{
+    EXPECT_EQ(Fill(Json::Value(Json::arrayValue)), Parse(R"({"earlier": 1, "volume": []})"));
+    EXPECT_EQ(korvstandin::CallCount(Op::KORVSpaceInfoEnum), 1);
+    Json::Value notAnObject = "x";
+    EXPECT_TRUE(KORVSNMP::FillInCurrentSpaceIO(Parse(R"([{"device": "total"}])"), notAnObject));
+    EXPECT_EQ(notAnObject, Parse(R"({"volume": [], "total": {"device": "total"}})"));
+    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
+}
+
+// A block device that the running kernel has.
+struct KernelDevice {
+    unsigned int major;
+    unsigned int minor;
+    std::string name;  // its kernel name
+};
+
+std::vector<KernelDevice> KernelDevices()
+{
+    std::vector<KernelDevice> devices;
+    DIR *directory = opendir(kSysBlock);
+    if (directory == nullptr)
+        return devices;
+    while (const dirent *entry = readdir(directory)) {
+        KernelDevice device{};
+        if (std::sscanf(entry->d_name, "%u:%u", &device.major, &device.minor) != 2)
+            continue;
+        std::error_code error;
+        auto target = std::filesystem::read_symlink(std::string(kSysBlock) + "/" + entry->d_name,
+                                                    error);
+        if (error || target.filename().empty())
+            continue;
+        device.name = target.filename().string();
+        devices.push_back(device);
+    }
+    closedir(directory);
+    std::sort(devices.begin(), devices.end(),
+              [](const KernelDevice &a, const KernelDevice &b) { return a.name < b.name; });
+    return devices;
+}
+
+class SpaceIONodeTest : public SpaceIOTest {
+protected:
+    void SetUp() override
+    {
+        SpaceIOTest::SetUp();
+        devices_ = KernelDevices();
+        if (devices_.size() < kNodesNeeded)
+            GTEST_SKIP() << "needs " << kNodesNeeded << " block devices under " << kSysBlock
+                         << ", found " << devices_.size();
+        char pattern[] = "/tmp/korvsnmp_space_XXXXXX";
+        ASSERT_NE(mkdtemp(pattern), nullptr) << std::strerror(errno);
+        directory_ = pattern;
+        for (size_t i = 0; i < kNodesNeeded; ++i) {
+            nodes_.push_back(directory_ + "/node" + std::to_string(i));
+            if (mknod(nodes_.back().c_str(), S_IFBLK | 0600,
+                      makedev(devices_[i].major, devices_[i].minor)) != 0)
+                GTEST_SKIP() << "cannot make block-device nodes: " << std::strerror(errno);
+        }
+    }
+
+    void TearDown() override
+    {
+        if (!directory_.empty())
+            std::filesystem::remove_all(directory_);
+    }
+
+    // Path of a node for device `i`, and that device's kernel name.
+    const std::string &Node(size_t i) const { return nodes_.at(i); }
+    const std::string &Name(size_t i) const { return devices_.at(i).name; }
+
+    std::string Record(size_t i, const std::string &members = "") const
+    {
+        return R"({"device": ")" + Name(i) + '"' + (members.empty() ? "" : ", " + members) + "}";
+    }
+
+    std::vector<KernelDevice> devices_;
+    std::string directory_;
+    std::vector<std::string> nodes_;
+};
+
+TEST_F(SpaceIONodeTest, SpaceDevicesAreNamedAndTheLastTotalKept)
+{
+    korvstandin::Host().spaces = {{Node(0), "Volume 1"}, {Node(1), "Volume 2"}, {Node(2), ""}};
+    const Json::Value space = Fill(Parse("[" + Record(1, R"("r": 1, "display_name": "old")") +
+                                         R"(, {"device": "total", "n": 1}, )" + Record(3) +
+                                         R"(, {"r": 9}, null, )" + Record(0) + ", " + Record(2) +
+                                         R"(, {"device": "Total"}, {"device": "total", "n": 2}, )" +
+                                         Record(1, R"("r": 2)") + "]"));
+    EXPECT_EQ(space, Parse(R"({"earlier": 1, "total": {"device": "total", "n": 2}, "volume": [)" +
+                           Record(1, R"("r": 1, "display_name": "Volume 2")") + ", " +
+                           Record(0, R"("display_name": "Volume 1")") + ", " +
+                           Record(1, R"("r": 2, "display_name": "Volume 2")") + "]}"))
+        << space.toStyledString();
+    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
+}
+
+TEST_F(SpaceIONodeTest, NodesThatCannotBeResolvedGetNoName)
+{
+    const std::string file = directory_ + "/regular";
+    std::ofstream(file) << "not a device";
+    const std::string unlinked = directory_ + "/unlinked";
+    ASSERT_EQ(mknod(unlinked.c_str(), S_IFBLK | 0600, makedev(devices_[0].major, 1048575)), 0);
+    ASSERT_FALSE(std::filesystem::exists(std::string(kSysBlock) + "/" +
+                                         std::to_string(devices_[0].major) + ":1048575"));
+    korvstandin::Host().spaces = {{directory_ + "/missing", "Missing"},
+                                  {file, "File"},
+                                  {unlinked, "Unlinked"},
+                                  {Node(1), "Volume 2"}};
+    const Json::Value space = Fill(Parse("[" + Record(0) + ", " + Record(1) + "]"));
+    EXPECT_EQ(space["volume"], Parse("[" + Record(1, R"("display_name": "Volume 2")") + "]"))
+        << space.toStyledString();
+}
+
+TEST_F(SpaceIONodeTest, LongDisplayNamesAreCutTo1023Characters)
+{
+    const std::string longName(1500, 'n');
+    korvstandin::Host().spaces = {{Node(0), longName}, {Node(1), "space beneath"}};
+    korvstandin::Host().flashCaches = {{Node(1), "/" + longName + "v", "", false}};
+    korvstandin::Host().flashCaches[0].layerPath = Node(2);
+    const Json::Value space = Fill(Parse("[" + Record(0) + ", " + Record(2) + "]"));
+    ASSERT_EQ(space["volume"].size(), 2u) << space.toStyledString();
+    EXPECT_EQ(space["volume"][0]["display_name"].asString(), longName.substr(0, 1023));
+    EXPECT_EQ(space["volume"][1]["display_name"].asString(), longName.substr(0, 1023));
+}
+
+TEST_F(SpaceIONodeTest, CachedSpaceIsReportedThroughTheCacheDevice)
+{
+    korvstandin::Host().spaces = {{Node(0), "beneath"}, {Node(1), "Volume 2"}};
+    korvstandin::Host().flashCaches = {{Node(0), "//volume1", Node(2), false}};
+    korvstandin::SetJournal(true);
+    const Json::Value space =
+        Fill(Parse("[" + Record(0) + ", " + Record(1) + ", " + Record(2, R"("r": 5)") + "]"));
+    EXPECT_EQ(space["volume"], Parse("[" + Record(1, R"("display_name": "Volume 2")") + ", " +
+                                     Record(2, R"("r": 5, "display_name": "/volume1")") + "]"))
+        << space.toStyledString();
+    EXPECT_THAT(korvstandin::Journal(),
+                ElementsAre("KORVSpaceInfoEnum(1)", "KORVFlashCacheConfigGet(0)",
+                            "KORVVSpaceLayerPathGet(1, //volume1, " + Node(0) + ", 128)",
+                            "KORVFlashCacheConfigFree()", "KORVSpaceInfoFree()"));
+}
+
+TEST_F(SpaceIONodeTest, EachCacheSuppressesOneSpaceWithItsPath)
+{
+    korvstandin::Host().spaces = {{Node(0), "first"}, {Node(0), "second"}, {Node(3), "plain"}};
+    korvstandin::Host().flashCaches = {{Node(0), "/cache1", Node(1), false},
+                                       {Node(0), "/cache2", Node(2), false},
+                                       {Node(4), "/cache3", Node(3), false}};
+    const Json::Value spaceIO =
+        Parse("[" + Record(0) + ", " + Record(1) + ", " + Record(2) + ", " + Record(3) + "]");
+    // A space on a cache's layered device replaces the cache's name.
+    const std::string cachesAndPlain = Record(1, R"("display_name": "cache1")") + ", " +
+                                       Record(2, R"("display_name": "cache2")") + ", " +
+                                       Record(3, R"("display_name": "plain")");
+    Json::Value space = Fill(spaceIO);
+    EXPECT_EQ(space["volume"], Parse("[" + cachesAndPlain + "]")) << space.toStyledString();
+
+    // A third space with the cached path is beyond what the two caches take.
+    korvstandin::Host().spaces.insert(korvstandin::Host().spaces.begin() + 2, {Node(0), "third"});
+    space = Fill(spaceIO);
+    EXPECT_EQ(space["volume"],
+              Parse("[" + Record(0, R"("display_name": "third")") + ", " + cachesAndPlain + "]"))
+        << space.toStyledString();
+}
+
+TEST_F(SpaceIONodeTest, UnresolvedCachesLeaveTheirSpacesNamed)
+{
+    const std::string file = directory_ + "/regular";
+    std::ofstream(file) << "not a device";
+    korvstandin::Host().spaces = {{Node(0), "zero"}, {Node(1), "one"}, {Node(2), "two"}};
+    korvstandin::Host().flashCaches = {{Node(0), "/c0", Node(3), true},
+                                       {Node(1), "/c1", file, false},
+                                       {Node(2), "/c2", directory_ + "/missing", false}};
+    const std::string spaceIO =
+        "[" + Record(0) + ", " + Record(1) + ", " + Record(2) + ", " + Record(3) + "]";
+    const Json::Value expected =
+        Parse("[" + Record(0, R"("display_name": "zero")") + ", " +
+              Record(1, R"("display_name": "one")") + ", " + Record(2, R"("display_name": "two")") +
+              "]");
+    EXPECT_EQ(Fill(Parse(spaceIO))["volume"], expected);
+
+    // Without the cache list, no cache is named either way.
+    korvstandin::Host().flashCaches = {{Node(0), "/c0", Node(3), false}};
+    for (Fault fault : {Fault::Fail, Fault::FailLeavingList}) {
+        korvstandin::SetFault(Op::KORVFlashCacheConfigGet, fault);
+        EXPECT_EQ(Fill(Parse(spaceIO))["volume"], expected);
+    }
+    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
+}
+
+// A link target of 1024 characters or more stays terminated and is cut: the
+// test replaces /sys/dev/block, in a mount namespace of a child process of
+// its own, with one long link.
+TEST_F(SpaceIONodeTest, OverlongLinkTargetIsCutAndTerminated)
+{
+    constexpr int kRefused = 77;
+    const std::string target =
+        "../" + std::string(1000, 'd') + "/abcdefghijklmnopqrstuvwxyz0123456789";
+    const std::string kept = target.substr(0, 1023);
+    const std::string key = kept.substr(kept.rfind('/') + 1);
+    korvstandin::Host().spaces = {{Node(0), "long link"}};
+    const Json::Value spaceIO = Parse(R"([{"device": ")" + key + R"("}])");
+    const std::string link = std::string(kSysBlock) + "/" + std::to_string(devices_[0].major) +
+                             ":" + std::to_string(devices_[0].minor);
+
+    pid_t child = fork();
+    ASSERT_NE(child, -1) << std::strerror(errno);
+    if (child == 0) {
+        if (unshare(CLONE_NEWNS) != 0 ||
+            mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+            mount("tmpfs", kSysBlock, "tmpfs", 0, nullptr) != 0 ||
+            symlink(target.c_str(), link.c_str()) != 0)
+            _exit(kRefused);
+        Json::Value space;
+        bool named = KORVSNMP::FillInCurrentSpaceIO(spaceIO, space) &&
+                     space["volume"].size() == 1 &&
+                     space["volume"][0]["display_name"] == "long link";
+        _exit(named ? 0 : 1);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(child, &status, 0), child);
+    ASSERT_TRUE(WIFEXITED(status)) << "the child ended abnormally";
+    if (WEXITSTATUS(status) == kRefused)
+        GTEST_SKIP() << "cannot replace " << kSysBlock << " in a private mount namespace";
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "the device was not named under the key " << key;
+}
+
+}  // namespace
