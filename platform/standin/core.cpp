@@ -6,7 +6,8 @@
 #include "standin_internal.h"
 
 using korvstandin::Fault;
-using korvstandin::Host;
+using korvstandin::detail::Current;
+using korvstandin::detail::Domain;
 using korvstandin::Op;
 using korvstandin::detail::Enter;
 using korvstandin::detail::Text;
@@ -32,14 +33,14 @@ extern "C" {
 int KLIBCIsQuillbox(void)
 {
     Enter(Op::KLIBCIsQuillbox);
-    return Host().quillbox ? 1 : 0;
+    return Current(Domain::Model).quillbox ? 1 : 0;
 }
 
 unsigned int KLIBSystemPhysMemSizeGet(void)
 {
     if (Enter(Op::KLIBSystemPhysMemSizeGet) != Fault::None)
         return 0;
-    return Host().physMemSize;
+    return Current(Domain::Memory).physMemSize;
 }
 
 int KLIBCSzListFind(const KLIBCSzList *list, const char *text)
@@ -102,7 +103,7 @@ int KLIBCFileGetSectionValue(const char *path, const char *section, const char *
     if (path == nullptr || section == nullptr || key == nullptr || buffer == nullptr ||
         size <= 0)
         return -1;
-    const auto &files = Host().files;
+    const auto &files = Current(Domain::Files).files;
     auto file = files.find(path);
     if (file == files.end())
         return -1;

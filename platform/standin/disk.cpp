@@ -11,7 +11,8 @@
 
 using korvstandin::ExternalDeviceSet;
 using korvstandin::Fault;
-using korvstandin::Host;
+using korvstandin::detail::Current;
+using korvstandin::detail::Domain;
 using korvstandin::Op;
 using korvstandin::detail::CopyText;
 using korvstandin::detail::Enter;
@@ -23,7 +24,7 @@ DiskInfoList *BuildDiskList()
 {
     DiskInfoList *head = nullptr;
     DiskInfoList **tail = &head;
-    for (const korvstandin::Disk &disk : Host().disks) {
+    for (const korvstandin::Disk &disk : Current(Domain::Disks).disks) {
         auto *node = new DiskInfoList{};
         if (!disk.recordMissing) {
             node->disk = new DiskInfo{};
@@ -56,7 +57,7 @@ EBoxInfo *BuildUnitList()
 {
     EBoxInfo *head = nullptr;
     EBoxInfo **tail = &head;
-    for (const korvstandin::ExpansionUnit &unit : Host().expansionUnits) {
+    for (const korvstandin::ExpansionUnit &unit : Current(Domain::Disks).expansionUnits) {
         auto *node = new StandinEBox{};
         node->info.unitNumber = unit.number;
         node->info.diskPaths = korvstandin::detail::NewSzList(unit.diskPaths);
@@ -78,9 +79,9 @@ const ExternalDeviceSet *DeviceSetOf(int kind)
 {
     switch (kind) {
     case EXTERNAL_USB_DEVICE:
-        return &Host().usb;
+        return &Current(Domain::Disks).usb;
     case EXTERNAL_ESATA_DEVICE:
-        return &Host().esata;
+        return &Current(Domain::Disks).esata;
     default:
         return nullptr;
     }
@@ -125,7 +126,7 @@ int SupportEBox(void)
 {
     if (Enter(Op::SupportEBox) != Fault::None)
         return 0;
-    return Host().supportsEBox ? 1 : 0;
+    return Current(Domain::Model).supportsEBox ? 1 : 0;
 }
 
 int KORVEBoxInfoEnum(EBoxInfo **head)

@@ -169,6 +169,10 @@ HostDescription &Host();
 // the last error. Outstanding allocations are real and stay counted.
 void Reset();
 
+// Answers from the live host again, as before any test described one: every
+// enumeration probes this machine afresh. Faults and counters stay.
+void UseLiveHost();
+
 // Number of calls of `op` since the last Reset.
 int CallCount(Op op);
 

@@ -5,7 +5,8 @@
 #include "standin_internal.h"
 
 using korvstandin::Fault;
-using korvstandin::Host;
+using korvstandin::detail::Current;
+using korvstandin::detail::Domain;
 using korvstandin::NetInterface;
 using korvstandin::NetRole;
 using korvstandin::Op;
@@ -19,7 +20,7 @@ const NetInterface *FindInterface(const char *name)
 {
     if (name == nullptr)
         return nullptr;
-    for (const NetInterface &entry : Host().interfaces)
+    for (const NetInterface &entry : Current(Domain::Network).interfaces)
         if (entry.name == name)
             return &entry;
     return nullptr;
@@ -37,7 +38,7 @@ int KLIBNetGetInterfaceInfo(KLIBNetInterfaceInfo *records, int capacity, int fla
         return -1;
     if (records == nullptr || capacity <= 0)
         return -1;
-    const auto &interfaces = Host().interfaces;
+    const auto &interfaces = Current(Domain::Network).interfaces;
     int filled = static_cast<int>(std::min<size_t>(interfaces.size(), static_cast<size_t>(capacity)));
     for (int i = 0; i < filled; ++i)
         CopyText(records[i].name, sizeof records[i].name, interfaces[i].name);
@@ -100,7 +101,7 @@ int KORVPPPoeIntfGet(char *name, int size)
 {
     if (Enter(Op::KORVPPPoeIntfGet, size) != Fault::None)
         return -1;
-    const std::string &pppoe = Host().pppoeInterface;
+    const std::string &pppoe = Current(Domain::Network).pppoeInterface;
     if (pppoe.empty() || name == nullptr || size <= 0)
         return -1;
     CopyText(name, static_cast<size_t>(size), pppoe);

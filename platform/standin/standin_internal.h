@@ -10,6 +10,14 @@
 
 namespace korvstandin::detail {
 
+// The parts of the description that the live host is probed for.
+enum class Domain { Model, Memory, Disks, Network, Storage, Luns, Files };
+
+// The description that the operations answer from. While no test has
+// described a host (through Host() or Reset()), `domain` is first probed
+// afresh from the live host.
+const HostDescription &Current(Domain domain);
+
 bool JournalOn();
 void Record(std::string entry);
 

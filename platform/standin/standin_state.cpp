@@ -2,6 +2,7 @@
 #include <array>
 #include <cstring>
 
+#include "live_host.h"
 #include "standin_internal.h"
 
 namespace korvstandin {
@@ -20,6 +21,7 @@ struct LastError {
 
 struct State {
     HostDescription host;
+    bool described = false;  // a test describes the host; else it is probed live
     std::array<FaultSwitch, static_cast<size_t>(Op::Count_)> faults{};
     std::array<int, static_cast<size_t>(Op::Count_)> calls{};
     bool journalOn = false;
@@ -61,17 +63,28 @@ void SetFault(Op op, Fault fault, unsigned int errorCode)
         TheState().faults[Index(op)] = {fault, errorCode};
 }
 
-HostDescription &Host() { return TheState().host; }
+HostDescription &Host()
+{
+    TheState().described = true;
+    return TheState().host;
+}
 
 void Reset()
 {
     State &state = TheState();
+    state.described = true;
     state.host = HostDescription{};
     state.faults.fill({});
     state.calls.fill(0);
     state.journalOn = false;
     state.journal.clear();
     state.lastError = {};
+}
+
+void UseLiveHost()
+{
+    TheState().described = false;
+    TheState().host = HostDescription{};
 }
 
 int CallCount(Op op) { return op < Op::Count_ ? TheState().calls[Index(op)] : 0; }
@@ -83,6 +96,48 @@ void SetJournal(bool on) { TheState().journalOn = on; }
 const std::vector<std::string> &Journal() { return TheState().journal; }
 
 namespace detail {
+
+const HostDescription &Current(Domain domain)
+{
+    State &state = TheState();
+    if (state.described)
+        return state.host;
+    HostDescription &host = state.host;
+    const std::string liveRoot;  // the real /
+    switch (domain) {
+    case Domain::Model:  // an ordinary Linux host: no Quillbox, no expansion units
+        break;
+    case Domain::Memory:
+        host.physMemSize = live::ProbeMemory();
+        break;
+    case Domain::Disks:
+        host.disks.clear();
+        host.usb = {};
+        host.esata = {};
+        host.expansionUnits.clear();
+        live::ProbeDisks(liveRoot, host);
+        break;
+    case Domain::Network:
+        host.interfaces.clear();
+        host.pppoeInterface.clear();
+        live::ProbeNetwork(liveRoot, host);
+        break;
+    case Domain::Storage:
+        host.spaces.clear();
+        host.flashCaches.clear();
+        live::ProbeSpaces(liveRoot, host);
+        break;
+    case Domain::Luns:
+        host.luns.clear();
+        live::ProbeLuns(liveRoot, host);
+        break;
+    case Domain::Files:
+        host.files.clear();
+        live::ProbeStrings(liveRoot, host);
+        break;
+    }
+    return host;
+}
 
 bool JournalOn() { return TheState().journalOn; }
 

@@ -4,18 +4,19 @@
 #include "standin_internal.h"
 
 using korvstandin::Fault;
-using korvstandin::Host;
+using korvstandin::detail::Current;
+using korvstandin::detail::Domain;
 using korvstandin::Op;
 using korvstandin::detail::CopyText;
 using korvstandin::detail::Enter;
 
 namespace {
 
-SpaceInfo *BuildSpaceList()
+SpaceInfo *BuildSpaceList(const std::vector<korvstandin::Space> &spaces)
 {
     SpaceInfo *head = nullptr;
     SpaceInfo **tail = &head;
-    for (const korvstandin::Space &space : Host().spaces) {
+    for (const korvstandin::Space &space : spaces) {
         auto *node = new SpaceInfo{};
         CopyText(node->devicePath, sizeof node->devicePath, space.devicePath);
         CopyText(node->name, sizeof node->name, space.name);
@@ -34,11 +35,11 @@ char *Duplicate(const std::string &text)
     return copy;
 }
 
-FlashCacheConfig *BuildFlashCacheList()
+FlashCacheConfig *BuildFlashCacheList(const std::vector<korvstandin::FlashCache> &caches)
 {
     FlashCacheConfig *head = nullptr;
     FlashCacheConfig **tail = &head;
-    for (const korvstandin::FlashCache &cache : Host().flashCaches) {
+    for (const korvstandin::FlashCache &cache : caches) {
         auto *node = new FlashCacheConfig{};
         node->spacePath = Duplicate(cache.spacePath);
         node->volumePath = Duplicate(cache.volumePath);
@@ -59,7 +60,7 @@ int KORVSpaceInfoEnum(int flags, SpaceInfo **list)
     Fault fault = Enter(Op::KORVSpaceInfoEnum, flags);
     if (list == nullptr || fault == Fault::Fail)
         return -1;
-    *list = BuildSpaceList();
+    *list = BuildSpaceList(Current(Domain::Storage).spaces);
     return fault == Fault::None ? 0 : -1;
 }
 
@@ -81,10 +82,11 @@ int KORVFlashCacheConfigGet(int flags, FlashCacheConfig **list)
     Fault fault = Enter(Op::KORVFlashCacheConfigGet, flags);
     if (list == nullptr || fault == Fault::Fail)
         return -1;
-    *list = BuildFlashCacheList();
+    const auto &caches = Current(Domain::Storage).flashCaches;
+    *list = BuildFlashCacheList(caches);
     if (fault != Fault::None)
         return -1;
-    return static_cast<int>(Host().flashCaches.size());
+    return static_cast<int>(caches.size());
 }
 
 void KORVFlashCacheConfigFree(FlashCacheConfig *list)
@@ -111,7 +113,7 @@ int KORVVSpaceLayerPathGet(int flags, const SpaceLayerRef *ref, char *buffer, in
     if (ref == nullptr || ref->volumePath == nullptr || ref->spacePath == nullptr ||
         buffer == nullptr || size <= 0)
         return -1;
-    for (const korvstandin::FlashCache &cache : Host().flashCaches) {
+    for (const korvstandin::FlashCache &cache : Current(Domain::Storage).flashCaches) {
         if (cache.volumePath != ref->volumePath || cache.spacePath != ref->spacePath)
             continue;
         if (cache.layerFails)

@@ -5,7 +5,8 @@
 #include "standin_internal.h"
 
 using korvstandin::Fault;
-using korvstandin::Host;
+using korvstandin::detail::Current;
+using korvstandin::detail::Domain;
 using korvstandin::LunAnswer;
 using korvstandin::Op;
 using korvstandin::detail::Enter;
@@ -35,7 +36,7 @@ Json::Value ErrorResponse(int code)
 
 Json::Value LunListResponse()
 {
-    const korvstandin::HostDescription &host = Host();
+    const korvstandin::HostDescription &host = Current(Domain::Luns);
     if (host.lunAnswer == LunAnswer::Unsuccessful)
         return ErrorResponse(kRunFailedError);
     Json::Value response(Json::objectValue);
