@@ -1,0 +1,94 @@
+// korvsnmp-stat: what libkorvsnmp reports for this appliance, for operators
+// and scripts.
+#include <syslog.h>
+
+#include <iostream>
+#include <string>
+#include <vector>
+
+#include <json/writer.h>
+
+#include "korvsnmp/korvsnmp.h"
+#include "options.h"
+#include "table_format.h"
+
+namespace {
+
+constexpr int kExitFailure = 1;
+constexpr int kExitUsage = 2;
+constexpr char kHostName[] = "localhost";
+
+int Fail(const std::string &what)
+{
+    std::cerr << "korvsnmp-stat: " << what << '\n';
+    return kExitFailure;
+}
+
+Json::Value BuildRequest(const std::vector<std::string> &resources)
+{
+    Json::Value request(Json::objectValue);
+    Json::Value &list = request["resource"] = Json::Value(Json::arrayValue);
+    for (const std::string &name : resources)
+        list.append(name);
+    return request;
+}
+
+void Print(const Json::Value &result, korvstat::Format format)
+{
+    switch (format) {
+    case korvstat::Format::Table:
+        korvstat::WriteTables(result, std::cout);
+        break;
+    case korvstat::Format::CompactJson:
+        std::cout << Json::FastWriter().write(result);
+        break;
+    case korvstat::Format::PrettyJson:
+        std::cout << result.toStyledString();
+        break;
+    }
+}
+
+int Statistics(const korvstat::Options &options)
+{
+    const Json::Value request = BuildRequest(options.resources);
+    Transmitor transmitor(kHostName);
+    if (transmitor.Transmit(request) != 0)
+        return Fail("no statistics from the collector on /tmp/korvsnmpcd.sock");
+    Json::Value reply;
+    if (transmitor.GetDataJson(reply) != 0)
+        return Fail("the collector's reply is not JSON");
+    Json::Value result(Json::objectValue);
+    if (!SNMPParseReplyData(request, reply, result))
+        return Fail("the collector's reply could not be assembled into statistics");
+    Print(result, options.format);
+    return 0;
+}
+
+}  // namespace
+
+int main(int argc, char **argv)
+{
+    korvstat::Options options;
+    std::string error;
+    if (!korvstat::ParseOptions(std::vector<std::string>(argv + 1, argv + argc), options, error)) {
+        std::cerr << "korvsnmp-stat: " << error << "\n\n" << korvstat::kUsage;
+        return kExitUsage;
+    }
+    // The library's messages go to standard error as well as to the system log.
+    openlog("korvsnmp-stat", LOG_PERROR, LOG_USER);
+
+    switch (options.action) {
+    case korvstat::Action::Help:
+        std::cout << korvstat::kUsage;
+        return 0;
+    case korvstat::Action::Reload:
+        return Transmitor::Reload() ? 0 : Fail("the collector did not reload");
+    case korvstat::Action::HistoryMode:
+        return Transmitor::EnterHistoryMode(options.reason)
+                   ? 0
+                   : Fail("the collector did not enter history mode");
+    case korvstat::Action::Statistics:
+        break;
+    }
+    return Statistics(options);
+}
