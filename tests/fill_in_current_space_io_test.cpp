@@ -1,7 +1,6 @@
 // The space section. Device nodes are real: the tests make block-device nodes
 // for devices that the running kernel has, so that their kernel names come
 // back through the real links under /sys/dev/block.
-#include <dirent.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
@@ -23,6 +22,7 @@
 #include <json/reader.h>
 
 #include "korv_standin.h"
+#include "block_nodes.h"
 #include "korvsnmp/fill_in_current_space_io.h"
 #include "syslog_capture.h"
 
@@ -108,75 +108,28 @@ TEST_F(SpaceIOTest, EmptySectionGivesAnEmptyVolumeList)
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
 }
 
-// A block device that the running kernel has.
-struct KernelDevice {
-    unsigned int major;
-    unsigned int minor;
-    std::string name;  // its kernel name
-};
-
-std::vector<KernelDevice> KernelDevices()
-{
-    std::vector<KernelDevice> devices;
-    DIR *directory = opendir(kSysBlock);
-    if (directory == nullptr)
-        return devices;
-    while (const dirent *entry = readdir(directory)) {
-        KernelDevice device{};
-        if (std::sscanf(entry->d_name, "%u:%u", &device.major, &device.minor) != 2)
-            continue;
-        std::error_code error;
-        auto target = std::filesystem::read_symlink(std::string(kSysBlock) + "/" + entry->d_name,
-                                                    error);
-        if (error || target.filename().empty())
-            continue;
-        device.name = target.filename().string();
-        devices.push_back(device);
-    }
-    closedir(directory);
-    std::sort(devices.begin(), devices.end(),
-              [](const KernelDevice &a, const KernelDevice &b) { return a.name < b.name; });
-    return devices;
-}
-
 class SpaceIONodeTest : public SpaceIOTest {
 protected:
     void SetUp() override
     {
         SpaceIOTest::SetUp();
-        devices_ = KernelDevices();
-        if (devices_.size() < kNodesNeeded)
-            GTEST_SKIP() << "needs " << kNodesNeeded << " block devices under " << kSysBlock
-                         << ", found " << devices_.size();
-        char pattern[] = "/tmp/korvsnmp_space_XXXXXX";
-        ASSERT_NE(mkdtemp(pattern), nullptr) << std::strerror(errno);
-        directory_ = pattern;
-        for (size_t i = 0; i < kNodesNeeded; ++i) {
-            nodes_.push_back(directory_ + "/node" + std::to_string(i));
-            if (mknod(nodes_.back().c_str(), S_IFBLK | 0600,
-                      makedev(devices_[i].major, devices_[i].minor)) != 0)
-                GTEST_SKIP() << "cannot make block-device nodes: " << std::strerror(errno);
-        }
-    }
-
-    void TearDown() override
-    {
-        if (!directory_.empty())
-            std::filesystem::remove_all(directory_);
+        std::string whyNot;
+        if (!nodes_.Make(kNodesNeeded, whyNot))
+            GTEST_SKIP() << whyNot;
+        directory_ = nodes_.Directory();
     }
 
     // Path of a node for device `i`, and that device's kernel name.
-    const std::string &Node(size_t i) const { return nodes_.at(i); }
-    const std::string &Name(size_t i) const { return devices_.at(i).name; }
+    const std::string &Node(size_t i) const { return nodes_.Node(i); }
+    const std::string &Name(size_t i) const { return nodes_.Name(i); }
 
     std::string Record(size_t i, const std::string &members = "") const
     {
         return R"({"device": ")" + Name(i) + '"' + (members.empty() ? "" : ", " + members) + "}";
     }
 
-    std::vector<KernelDevice> devices_;
+    korvtest::BlockNodes nodes_;
     std::string directory_;
-    std::vector<std::string> nodes_;
 };
 
 TEST_F(SpaceIONodeTest, SpaceDevicesAreNamedAndTheLastTotalKept)
@@ -200,9 +153,9 @@ TEST_F(SpaceIONodeTest, NodesThatCannotBeResolvedGetNoName)
     const std::string file = directory_ + "/regular";
     std::ofstream(file) << "not a device";
     const std::string unlinked = directory_ + "/unlinked";
-    ASSERT_EQ(mknod(unlinked.c_str(), S_IFBLK | 0600, makedev(devices_[0].major, 1048575)), 0);
+    ASSERT_EQ(mknod(unlinked.c_str(), S_IFBLK | 0600, makedev(nodes_.Device(0).major, 1048575)), 0);
     ASSERT_FALSE(std::filesystem::exists(std::string(kSysBlock) + "/" +
-                                         std::to_string(devices_[0].major) + ":1048575"));
+                                         std::to_string(nodes_.Device(0).major) + ":1048575"));
     korvstandin::Host().spaces = {{directory_ + "/missing", "Missing"},
                                   {file, "File"},
                                   {unlinked, "Unlinked"},
@@ -300,8 +253,8 @@ TEST_F(SpaceIONodeTest, OverlongLinkTargetIsCutAndTerminated)
     const std::string key = kept.substr(kept.rfind('/') + 1);
     korvstandin::Host().spaces = {{Node(0), "long link"}};
     const Json::Value spaceIO = Parse(R"([{"device": ")" + key + R"("}])");
-    const std::string link = std::string(kSysBlock) + "/" + std::to_string(devices_[0].major) +
-                             ":" + std::to_string(devices_[0].minor);
+    const std::string link = std::string(kSysBlock) + "/" + std::to_string(nodes_.Device(0).major) +
+                             ":" + std::to_string(nodes_.Device(0).minor);
 
     pid_t child = fork();
     ASSERT_NE(child, -1) << std::strerror(errno);
