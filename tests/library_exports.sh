@@ -18,7 +18,8 @@ for symbol in 'SocketInit()' \
     'Transmitor::Transmitor(' 'Transmitor::~Transmitor()' 'Transmitor::SetHostName(' \
     'Transmitor::Transmit(' 'Transmitor::GetDataStr(' 'Transmitor::GetDataJson(' \
     'Transmitor::TransmitData(' 'Transmitor::ReceiveData()' \
-    'Transmitor::EnterHistoryMode(' 'Transmitor::Reload()'; do
+    'Transmitor::EnterHistoryMode(' 'Transmitor::Reload()' \
+    'KORVSNMP::FillInCurrentDiskIO('; do
     echo "$exported" | grep -qF " $symbol" || fail "does not export $symbol"
 done
 
