@@ -42,6 +42,10 @@ constexpr size_t kDroppedModelPrefixLength = sizeof kDroppedModelPrefix - 1;
 // A negative group index marks a slot that users count from ten less.
 constexpr long long kUngroupedSlotOffset = 10;
 
+// The information query's flag for the kind of device.
+constexpr int kInfoFlagUsb = 1;
+constexpr int kInfoFlagOther = 0;
+
 constexpr char kTypeInternal[] = "internal";
 constexpr char kTypeEBox[] = "ebox";
 constexpr char kTypeUsb[] = "usb";
@@ -192,9 +196,9 @@ std::string SlotText(const DiskInfo &disk)
     return slot;
 }
 
-// The display name and type of `disk`; false for a container that names no
-// disk, which then gets an empty display name and no type.
-bool GetDiskDisplayName(const DiskInfo &disk, const EBoxWrapper *wrappers, DiskName &name)
+// The display name and type of `disk`; for a container that names no disk
+// (a bad disk), an empty display name and no type.
+DiskName GetDiskDisplayName(const DiskInfo &disk, const EBoxWrapper *wrappers)
 {
     TextTable table;
     if (table.Allocated())
@@ -204,6 +208,7 @@ bool GetDiskDisplayName(const DiskInfo &disk, const EBoxWrapper *wrappers, DiskN
     std::memcpy(devicePath, disk.devicePath, sizeof disk.devicePath);
     const EBoxInfo *unit = FindPoweredUnit(wrappers, devicePath);
 
+    DiskName name;
     char displayName[kDisplayNameSize] = {};
     const std::string diskText = GetVolumeText(table, kTextDisk);
     switch (disk.container) {
@@ -227,11 +232,10 @@ bool GetDiskDisplayName(const DiskInfo &disk, const EBoxWrapper *wrappers, DiskN
         break;
     default:
         KORVSNMP_LOG(LOG_ERR, "bad container: %d", disk.container);
-        name.displayName.clear();
-        return false;
+        return name;
     }
     name.displayName = displayName;
-    return true;
+    return name;
 }
 
 std::string DeviceNameOf(const DiskInfo &disk)
@@ -276,7 +280,11 @@ bool EnumInternalDiskNames(DiskNameMap &names)
     for (const DiskInfoList *node = disks.get(); node != nullptr; node = node->next) {
         if (node->disk == nullptr || (node->disk->container & kDiskContainerMask) == 0)
             continue;
-        GetDiskDisplayName(*node->disk, wrappers.Head(), names[DeviceNameOf(*node->disk)]);
+        DiskName &entry = names[DeviceNameOf(*node->disk)];
+        DiskName name = GetDiskDisplayName(*node->disk, wrappers.Head());
+        entry.displayName = std::move(name.displayName);
+        if (!name.type.empty())
+            entry.type = std::move(name.type);
     }
     return true;
 }
@@ -285,6 +293,7 @@ bool EnumInternalDiskNames(DiskNameMap &names)
 
 bool KORVExternalDevEnum(DiskNameMap &names, int kind)
 {
+    // A negative size is no answer either.
     int needed = 0;
     if (KORVUSBDevEnum(kind, nullptr, 0, &needed) < 0 || needed < 0) {
         KORVSNMP_LOG(LOG_ERR, "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE");
@@ -316,7 +325,7 @@ bool KORVExternalDevEnum(DiskNameMap &names, int kind)
         if (device == nullptr)
             continue;
         std::memset(info.get(), 0, sizeof *info);
-        if (KORVExtStgPartsVolInfoGet(device, info.get(), isUsb ? 1 : 0) < 0)
+        if (KORVExtStgPartsVolInfoGet(device, info.get(), isUsb ? kInfoFlagUsb : kInfoFlagOther) < 0)
             continue;
         DiskName &name = names[device];
         name.displayName = FieldText(info->displayName, sizeof info->displayName);
