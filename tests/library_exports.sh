@@ -20,7 +20,7 @@ for symbol in 'SocketInit()' \
     'Transmitor::TransmitData(' 'Transmitor::ReceiveData()' \
     'Transmitor::EnterHistoryMode(' 'Transmitor::Reload()' \
     'KORVSNMP::FillInCurrentMemory(' 'KORVSNMP::FillInCurrentLunIO(' \
-    'KORVSNMP::FillInCurrentSpaceIO('; do
+    'KORVSNMP::FillInCurrentSpaceIO(' 'KORVSNMP::FillInCurrentDiskIO('; do
     echo "$exported" | grep -qF " $symbol" || fail "does not export $symbol"
 done
 
