@@ -62,6 +62,7 @@ struct NetInterface {
     std::optional<int> memberCountClaim{};  // Aggregation: count written instead of members.size()
     int ovsMasterAnswer = 1;            // OvsMaster: KLIBNetOVSIfIsMaster's nonzero answer
     bool vlanQueryFails = false;        // KLIBNetVlanGet answers -1 for it
+    bool vlanRecordUnwritten = false;   // Vlan: KLIBNetVlanGet answers 1 yet writes nothing
     bool aggrQueryFails = false;        // KORVNetLinkAggrGet answers -1 for it
 };
 

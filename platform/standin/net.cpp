@@ -58,6 +58,8 @@ int KLIBNetVlanGet(const char *name, KLIBNetVlanInfo *vlan)
         return -1;
     if (entry->role != NetRole::Vlan)
         return 0;
+    if (entry->vlanRecordUnwritten)
+        return 1;
     // Only a VLAN's answer writes the record; other interfaces leave it as it was.
     CopyText(vlan->parent, sizeof vlan->parent, entry->vlanParent);
     CopyText(vlan->name, sizeof vlan->name, entry->vlanName);
