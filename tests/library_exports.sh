@@ -20,7 +20,8 @@ for symbol in 'SocketInit()' \
     'Transmitor::TransmitData(' 'Transmitor::ReceiveData()' \
     'Transmitor::EnterHistoryMode(' 'Transmitor::Reload()' \
     'KORVSNMP::FillInCurrentMemory(' 'KORVSNMP::FillInCurrentLunIO(' \
-    'KORVSNMP::FillInCurrentSpaceIO(' 'KORVSNMP::FillInCurrentDiskIO('; do
+    'KORVSNMP::FillInCurrentSpaceIO(' 'KORVSNMP::FillInCurrentDiskIO(' \
+    'KORVSNMP::FillInCurrentNetwork(' 'SNMPParseReplyData('; do
     echo "$exported" | grep -qF " $symbol" || fail "does not export $symbol"
 done
 

@@ -1,0 +1,401 @@
+// The statistics road on a large synthetic appliance: 72 disks (internal
+// bays, five expansion units, USB and eSATA), 32 interfaces with VLANs and
+// two aggregations, 64 spaces with flash caches, 512 LUNs.
+//
+//   floor:    the reply's bytes over the UNIX socket, parsed by Json::Reader
+//   road:     Transmit + GetDataJson + SNMPParseReplyData
+//   assembly: SNMPParseReplyData alone
+//
+// After the runs it prints road/floor, assembly/floor and the peak memory of
+// one whole-road call over the reply's size. Needs root (it makes block
+// device nodes for the spaces) and takes over /tmp/korvsnmpcd.sock.
+#include <arpa/inet.h>
+#include <malloc.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <map>
+#include <new>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <benchmark/benchmark.h>
+#include <json/reader.h>
+#include <json/writer.h>
+
+#include "korv_standin.h"
+#include "korvsnmp/korvsnmp.h"
+
+// ---- Allocation accounting, for the peak memory of one call ---------------
+
+namespace {
+std::atomic<long long> gLiveBytes{0};
+std::atomic<long long> gPeakBytes{0};
+
+void *Allocate(size_t size)
+{
+    void *block = std::malloc(size ? size : 1);
+    if (block == nullptr)
+        throw std::bad_alloc();
+    long long live = gLiveBytes += static_cast<long long>(malloc_usable_size(block));
+    long long peak = gPeakBytes.load();
+    while (live > peak && !gPeakBytes.compare_exchange_weak(peak, live)) {
+    }
+    return block;
+}
+
+void Release(void *block)
+{
+    if (block == nullptr)
+        return;
+    gLiveBytes -= static_cast<long long>(malloc_usable_size(block));
+    std::free(block);
+}
+}  // namespace
+
+void *operator new(size_t size) { return Allocate(size); }
+void *operator new[](size_t size) { return Allocate(size); }
+void operator delete(void *block) noexcept { Release(block); }
+void operator delete[](void *block) noexcept { Release(block); }
+void operator delete(void *block, size_t) noexcept { Release(block); }
+void operator delete[](void *block, size_t) noexcept { Release(block); }
+
+// The library logs to syslog; keep the benchmark's own messages out of the system log.
+extern "C" void syslog(int, const char *, ...) {}
+extern "C" void __syslog_chk(int, int, const char *, ...) {}
+
+namespace {
+
+constexpr char kSocketPath[] = "/tmp/korvsnmpcd.sock";
+constexpr int kInternalDisks = 24;
+constexpr int kExpansionUnits = 5;
+constexpr int kDisksPerUnit = 8;
+constexpr int kUsbDevices = 2;
+constexpr int kEsataDevices = 6;
+constexpr int kPlainInterfaces = 24;
+constexpr int kVlans = 6;
+constexpr int kSpaces = 64;
+constexpr int kFlashCaches = 16;
+constexpr int kLuns = 512;
+
+std::string DiskName(int index)
+{
+    std::string name = "sd";
+    if (index >= 26)
+        name += static_cast<char>('a' + index / 26 - 1);
+    return name + static_cast<char>('a' + index % 26);
+}
+
+// Real block-device nodes for the spaces: the library resolves each through
+// /sys/dev/block, as on the appliance.
+struct SpaceNodes {
+    std::filesystem::path directory;
+    std::vector<std::string> kernelNames;  // per space
+    std::vector<std::string> paths;
+
+    SpaceNodes()
+    {
+        char pattern[] = "/tmp/korvsnmp-bench-XXXXXX";
+        directory = mkdtemp(pattern);
+        std::vector<std::pair<std::string, std::string>> devices;  // "major:minor", kernel name
+        for (const auto &entry : std::filesystem::directory_iterator("/sys/dev/block"))
+            devices.emplace_back(entry.path().filename().string(),
+                                 std::filesystem::read_symlink(entry.path()).filename().string());
+        for (int i = 0; i < kSpaces && !devices.empty(); ++i) {
+            const auto &[numbers, kernelName] = devices[i % devices.size()];
+            unsigned major = 0, minor = 0;
+            std::sscanf(numbers.c_str(), "%u:%u", &major, &minor);
+            std::string path = (directory / ("space" + std::to_string(i))).string();
+            if (mknod(path.c_str(), S_IFBLK | 0600, makedev(major, minor)) != 0)
+                break;
+            paths.push_back(path);
+            kernelNames.push_back(kernelName);
+        }
+    }
+    ~SpaceNodes() { std::filesystem::remove_all(directory); }
+};
+
+Json::Value Counters(Json::Value record, unsigned seed)
+{
+    record["utilization"] = seed % 100;
+    record["read_access"] = seed * 3;
+    record["read_byte"] = seed * 4096;
+    record["write_access"] = seed * 5;
+    record["write_byte"] = seed * 8192;
+    return record;
+}
+
+Json::Value Device(const std::string &name)
+{
+    Json::Value record(Json::objectValue);
+    record["device"] = name;
+    return record;
+}
+
+// Describes the appliance to the stand-in, and returns the collector's reply.
+std::string DescribeAppliance(const SpaceNodes &nodes)
+{
+    using namespace korvstandin;
+    Reset();
+    HostDescription &host = Host();
+    host.physMemSize = 16777216;
+    host.supportsEBox = true;
+    host.files[kStringsFilePath]["volume"] = {{"volume_disk", "Disk"},
+                                              {"volume_expansion", "Expansion Unit"},
+                                              {"dedicated_ssd_cache", "SSD Cache"}};
+    Json::Value data(Json::objectValue);
+    Json::Value &disks = data["DiskIO"] = Json::Value(Json::arrayValue);
+    int index = 0;
+    for (; index < kInternalDisks; ++index)
+        host.disks.push_back({index + 1, DISK_CONTAINER_INTERNAL, 0, "/dev/" + DiskName(index)});
+    for (int unit = 0; unit < kExpansionUnits; ++unit) {
+        ExpansionUnit expansion{static_cast<unsigned>(unit + 1), {}, std::string("Korvel-X5"), true};
+        for (int slot = 0; slot < kDisksPerUnit; ++slot, ++index) {
+            host.disks.push_back({slot + 1, DISK_CONTAINER_EBOX, 0, "/dev/" + DiskName(index)});
+            expansion.diskPaths.push_back("/dev/" + DiskName(index));
+        }
+        host.expansionUnits.push_back(expansion);
+    }
+    for (int i = 0; i < kUsbDevices; ++i, ++index)
+        host.usb.devices.push_back({DiskName(index), "USB Disk " + std::to_string(i + 1)});
+    for (int i = 0; i < kEsataDevices; ++i, ++index)
+        host.esata.devices.push_back({DiskName(index), "eSATA Disk " + std::to_string(i + 1)});
+    for (int i = 0; i < index; ++i)
+        disks.append(Counters(Device(DiskName(i)), i + 1));
+
+    Json::Value &network = data["Network"] = Json::Value(Json::arrayValue);
+    for (int i = 0; i < kPlainInterfaces; ++i)
+        host.interfaces.push_back({"eth" + std::to_string(i)});
+    for (int i = 0; i < kVlans; ++i)
+        host.interfaces.push_back({"eth0." + std::to_string(i + 10), NetRole::Vlan, "eth0",
+                                   "eth0." + std::to_string(i + 10)});
+    host.interfaces.push_back({"bond0", NetRole::Aggregation, "", "", {"eth20", "eth21"}});
+    host.interfaces.push_back({"bond1", NetRole::Aggregation, "", "", {"eth22", "eth23"}});
+    for (const NetInterface &entry : host.interfaces) {
+        Json::Value record = Device(entry.name);
+        record["rx"] = 123456u;
+        record["tx"] = 654321u;
+        network.append(record);
+    }
+
+    Json::Value &spaces = data["SpaceIO"] = Json::Value(Json::arrayValue);
+    for (size_t i = 0; i < nodes.paths.size(); ++i) {
+        host.spaces.push_back({nodes.paths[i], "volume" + std::to_string(i + 1)});
+        if (static_cast<int>(i) < kFlashCaches)
+            host.flashCaches.push_back(
+                {nodes.paths[i], "/volume" + std::to_string(i + 1), nodes.paths[(i + 1) % nodes.paths.size()]});
+        spaces.append(Counters(Device(nodes.kernelNames[i]), static_cast<unsigned>(i + 7)));
+    }
+    spaces.append(Counters(Device("total"), 99));
+
+    Json::Value &luns = data["iSCSI"] = Json::Value(Json::arrayValue);
+    for (int i = 0; i < kLuns; ++i) {
+        std::string uuid = "6001405f-0000-4000-8000-" + std::to_string(100000000000 + i);
+        host.luns.push_back({Json::Value(uuid), Json::Value("LUN-" + std::to_string(i + 1))});
+        luns.append(Counters(Device(uuid), i + 3));
+    }
+
+    Json::Value cpu(Json::objectValue);
+    cpu["user"] = 12;
+    cpu["system"] = 5;
+    cpu["idle"] = 83;
+    data["System"].append(cpu);
+    Json::Value memory(Json::objectValue);
+    memory["total_real"] = 16777216;
+    memory["avail_real"] = 9000000;
+    data["Memory"].append(memory);
+    data["NFS"]["read"] = 10;
+    data["NFS"]["write"] = 20;
+    data["time"] = 1795000000;
+    Json::Value reply(Json::objectValue);
+    reply["data"] = data;
+    return Json::FastWriter().write(reply);
+}
+
+// Serves the framed reply to every connection, on its own thread.
+class Collector {
+public:
+    explicit Collector(const std::string &reply) : reply_(reply)
+    {
+        unlink(kSocketPath);
+        listenFd_ = socket(AF_UNIX, SOCK_STREAM, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, kSocketPath);
+        if (bind(listenFd_, reinterpret_cast<sockaddr *>(&address), sizeof address) != 0 ||
+            listen(listenFd_, 16) != 0) {
+            std::perror("benchmark collector");
+            std::exit(1);
+        }
+        uint32_t length = htonl(static_cast<uint32_t>(reply_.size()));
+        frame_.assign(reinterpret_cast<char *>(&length), sizeof length);
+        frame_ += reply_;
+        server_ = std::thread([this] { Serve(); });
+    }
+    ~Collector()
+    {
+        stop_ = true;
+        close(Connect());  // wakes the accept
+        server_.join();
+        close(listenFd_);
+        unlink(kSocketPath);
+    }
+
+    static int Connect()
+    {
+        int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, kSocketPath);
+        connect(fd, reinterpret_cast<sockaddr *>(&address), sizeof address);
+        return fd;
+    }
+
+private:
+    void Serve()
+    {
+        std::vector<char> request(65536);
+        while (!stop_) {
+            int fd = accept(listenFd_, nullptr, nullptr);
+            if (fd < 0)
+                continue;
+            if (!stop_ && read(fd, request.data(), request.size()) > 0)
+                for (size_t sent = 0; sent < frame_.size();) {
+                    ssize_t n = write(fd, frame_.data() + sent, frame_.size() - sent);
+                    if (n <= 0)
+                        break;
+                    sent += static_cast<size_t>(n);
+                }
+            close(fd);
+        }
+    }
+
+    std::string reply_;
+    std::string frame_;
+    int listenFd_;
+    std::atomic<bool> stop_{false};
+    std::thread server_;
+};
+
+Json::Value Request()
+{
+    Json::Value request(Json::objectValue);
+    request["resource"].append("all");
+    return request;
+}
+
+void Floor(benchmark::State &state)
+{
+    const std::string text = Json::FastWriter().write(Request());
+    std::string frame(4, '\0');
+    uint32_t length = htonl(static_cast<uint32_t>(text.size() + 1));
+    std::memcpy(frame.data(), &length, 4);
+    frame.append(text.c_str(), text.size() + 1);
+    std::vector<char> piece(65536);
+    for (auto _ : state) {
+        int fd = Collector::Connect();
+        if (write(fd, frame.data(), frame.size()) != static_cast<ssize_t>(frame.size()))
+            state.SkipWithError("write");
+        std::string received;
+        for (ssize_t n; (n = read(fd, piece.data(), piece.size())) > 0;)
+            received.append(piece.data(), static_cast<size_t>(n));
+        close(fd);
+        Json::Value reply;
+        Json::Reader().parse(received.data() + 4, received.data() + received.size(), reply, true);
+        benchmark::DoNotOptimize(reply);
+    }
+}
+
+void Road(benchmark::State &state)
+{
+    const Json::Value request = Request();
+    for (auto _ : state) {
+        Transmitor transmitor("localhost");
+        Json::Value reply, result(Json::objectValue);
+        if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(reply) != 0 ||
+            !SNMPParseReplyData(request, reply, result))
+            state.SkipWithError("the whole road failed");
+        benchmark::DoNotOptimize(result);
+    }
+}
+
+Json::Value gParsedReply;
+
+void Assembly(benchmark::State &state)
+{
+    const Json::Value request = Request();
+    for (auto _ : state) {
+        Json::Value result(Json::objectValue);
+        if (!SNMPParseReplyData(request, gParsedReply, result))
+            state.SkipWithError("assembly failed");
+        benchmark::DoNotOptimize(result);
+    }
+}
+
+// Keeps each benchmark's mean time per iteration, for the ratios.
+class RatioReporter : public benchmark::ConsoleReporter {
+public:
+    void ReportRuns(const std::vector<Run> &runs) override
+    {
+        for (const Run &run : runs)
+            if (run.run_type == Run::RT_Iteration && !run.error_occurred)
+                nanoseconds[run.benchmark_name()] = run.GetAdjustedRealTime();
+        ConsoleReporter::ReportRuns(runs);
+    }
+    std::map<std::string, double> nanoseconds;
+};
+
+}  // namespace
+
+int main(int argc, char **argv)
+{
+    SpaceNodes nodes;
+    const std::string reply = DescribeAppliance(nodes);
+    Collector collector(reply);
+    Json::Reader().parse(reply, gParsedReply);
+    std::printf("reply: %zu bytes; %zu spaces with block-device nodes\n", reply.size(),
+                nodes.paths.size());
+
+    // Peak memory of one whole-road call, above what was live before it.
+    {
+        const Json::Value request = Request();
+        long long before = gLiveBytes.load();
+        gPeakBytes = before;
+        {
+            Transmitor transmitor("localhost");
+            Json::Value parsed, result(Json::objectValue);
+            if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(parsed) != 0 ||
+                !SNMPParseReplyData(request, parsed, result)) {
+                std::fprintf(stderr, "the whole road failed\n");
+                return 1;
+            }
+        }
+        double ratio = static_cast<double>(gPeakBytes.load() - before) / reply.size();
+        std::printf("peak memory of one whole-road call: %lld bytes, %.2f x the reply (target <= 4)\n",
+                    gPeakBytes.load() - before, ratio);
+    }
+
+    benchmark::RegisterBenchmark("floor", Floor)->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark("road", Road)->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark("assembly", Assembly)->Unit(benchmark::kMicrosecond);
+    benchmark::Initialize(&argc, argv);
+    RatioReporter reporter;
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+
+    auto &ns = reporter.nanoseconds;
+    if (ns.count("floor") && ns.count("road") && ns.count("assembly")) {
+        std::printf("road/floor:     %.2f (target <= 1.3)\n", ns["road"] / ns["floor"]);
+        std::printf("assembly/floor: %.2f (target <= 0.25)\n", ns["assembly"] / ns["floor"]);
+    }
+    korvstandin::Reset();
+    return 0;
+}
