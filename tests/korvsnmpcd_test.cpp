@@ -581,9 +581,10 @@ private:
 
 class KorvsnmpcdDaemon : public ::testing::Test {
 protected:
+    // The daemon (a member) is started before SetUp runs: removing its path
+    // here would race with its bind. It replaces a stale socket file itself.
     void SetUp() override
     {
-        unlink(path_.c_str());
         ASSERT_GT(daemon_.Pid(), 0) << "cannot start " << KORVSNMPCD_PATH;
         ASSERT_TRUE(daemon_.WaitUntilAnswering()) << daemon_.Log();
     }
