@@ -64,6 +64,10 @@ void PrintGrid(const std::string &title, const Row &header, const std::vector<Ro
 void PrintRecords(const std::string &title, const std::vector<const Json::Value *> &records,
                   const std::vector<std::string> &preferred, std::ostream &out)
 {
+    if (records.empty()) {
+        out << title << "\n(none)\n\n";
+        return;
+    }
     std::vector<std::string> others;
     std::vector<bool> hasPreferred(preferred.size(), false);
     for (const Json::Value *record : records) {
