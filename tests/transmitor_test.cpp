@@ -81,6 +81,7 @@ TEST_P(TransmitorReplyTest, ReplyBodyStandsWholeInTheDataText)
 
     EXPECT_EQ(transmitor.dataStr, GetParam().expectedData);
     EXPECT_EQ(transmitor.socketFd, -1);
+    ASSERT_TRUE(collector.WaitForConnections(1));  // the collector has closed its end too
     EXPECT_EQ(korvtest::OpenDescriptorCount(), descriptors);
     EXPECT_THAT(LoggedMessages(), IsEmpty());
 }
@@ -192,6 +193,7 @@ TEST_P(TransmitorFailedReceiveTest, FailsClosesAndKeepsNoHalfReply)
 
     EXPECT_EQ(transmitor.socketFd, -1);
     EXPECT_EQ(transmitor.dataStr, "");
+    ASSERT_TRUE(collector.WaitForConnections(1));  // the collector has closed its end too
     EXPECT_EQ(korvtest::OpenDescriptorCount(), descriptors);
     std::vector<::testing::Matcher<korvtest::LogEntry>> expected;
     for (const std::string &message : GetParam().messages)
