@@ -17,7 +17,9 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
+#include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -69,9 +71,27 @@ void operator delete[](void *block) noexcept { Release(block); }
 void operator delete(void *block, size_t) noexcept { Release(block); }
 void operator delete[](void *block, size_t) noexcept { Release(block); }
 
-// The library logs to syslog; keep the benchmark's own messages out of the system log.
-extern "C" void syslog(int, const char *, ...) {}
-extern "C" void __syslog_chk(int, int, const char *, ...) {}
+// The library's messages (failures only) go to standard error, not to the
+// system log.
+extern "C" void vsyslog(int, const char *format, va_list args)
+{
+    std::vfprintf(stderr, format, args);
+    std::fputc('\n', stderr);
+}
+extern "C" void syslog(int priority, const char *format, ...)
+{
+    va_list args;
+    va_start(args, format);
+    vsyslog(priority, format, args);
+    va_end(args);
+}
+extern "C" void __syslog_chk(int priority, int, const char *format, ...)
+{
+    va_list args;
+    va_start(args, format);
+    vsyslog(priority, format, args);
+    va_end(args);
+}
 
 namespace {
 
@@ -261,6 +281,22 @@ public:
     }
 
 private:
+    // Reads one whole request frame: its length, then that many bytes.
+    static bool ReadRequest(int fd, std::vector<char> &buffer)
+    {
+        uint32_t length = 0;
+        if (read(fd, &length, sizeof length) != static_cast<ssize_t>(sizeof length))
+            return false;
+        size_t missing = std::min<size_t>(ntohl(length), buffer.size());
+        while (missing > 0) {
+            ssize_t n = read(fd, buffer.data(), missing);
+            if (n <= 0)
+                return false;
+            missing -= static_cast<size_t>(n);
+        }
+        return true;
+    }
+
     void Serve()
     {
         std::vector<char> request(65536);
@@ -268,7 +304,7 @@ private:
             int fd = accept(listenFd_, nullptr, nullptr);
             if (fd < 0)
                 continue;
-            if (!stop_ && read(fd, request.data(), request.size()) > 0)
+            if (!stop_ && ReadRequest(fd, request))
                 for (size_t sent = 0; sent < frame_.size();) {
                     ssize_t n = write(fd, frame_.data() + sent, frame_.size() - sent);
                     if (n <= 0)

@@ -1,4 +1,10 @@
 // korvsnmp-stat's command line and its tables.
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <fstream>
+#include <iterator>
 #include <sstream>
 
 #include <gmock/gmock.h>
@@ -8,6 +14,7 @@
 
 #include "options.h"
 #include "table_format.h"
+#include "test_collector.h"
 
 namespace {
 
@@ -113,6 +120,83 @@ TEST(KorvsnmpStatTables, ValuesOfUnexpectedShapesAreShownNotThrown)
     std::ostringstream scalar;
     korvstat::WriteTables(Json::Value(5), scalar);
     EXPECT_EQ(scalar.str(), "5\n");
+}
+
+}  // namespace
+
+namespace {
+
+struct ProgramRun {
+    int status;
+    std::string out;
+    std::string err;
+};
+
+// Runs the built korvsnmp-stat with `arguments` (shell words).
+ProgramRun RunStat(const std::string &arguments)
+{
+    char pattern[] = "/tmp/korvsnmp-stat-err-XXXXXX";
+    int errFd = mkstemp(pattern);
+    close(errFd);
+    const std::string command =
+        std::string(KORVSNMP_STAT_PATH) + " " + arguments + " 2>" + pattern;
+    ProgramRun run{-1, "", ""};
+    FILE *pipe = popen(command.c_str(), "r");
+    if (pipe == nullptr)
+        return run;
+    char buffer[4096];
+    for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+        run.out.append(buffer, n);
+    int status = pclose(pipe);
+    run.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    std::ifstream err(pattern);
+    run.err.assign(std::istreambuf_iterator<char>(err), std::istreambuf_iterator<char>());
+    unlink(pattern);
+    return run;
+}
+
+const char kCpuAndNfsReply[] =
+    R"({"data": {"System": [{"user": 12, "idle": 88}], "NFS": {"read": 5}, "time": 1795000000}})";
+
+TEST(KorvsnmpStatProgram, PrintsTheAssembledResultAsJsonAndTables)
+{
+    korvtest::TestCollector collector;
+    for (int i = 0; i < 2; ++i)
+        collector.Script({korvtest::Frame(kCpuAndNfsReply)});
+
+    ProgramRun json = RunStat("--resource cpu,nfs --compact");
+    ProgramRun table = RunStat("--resource nfs,cpu --format table");
+
+    EXPECT_EQ(json.status, 0) << json.err;
+    EXPECT_EQ(json.out, "{\"cpu\":{\"idle\":88,\"user\":12},\"nfs\":{\"read\":5},\"time\":1795000000}\n");
+    EXPECT_EQ(table.status, 0) << table.err;
+    EXPECT_THAT(Lines(table.out), ElementsAre("CPU", "member  value", "idle    88", "user    12", "",
+                                              "NFS", "member  value", "read    5", "",
+                                              "Time  1795000000"));
+    ASSERT_TRUE(collector.WaitForConnections(2));
+    EXPECT_EQ(collector.Requests().at(0),
+              korvtest::Frame(std::string("{\"resource\":[\"cpu\",\"nfs\"]}\n") + '\0'));
+}
+
+TEST(KorvsnmpStatProgram, NoCollectorIsAClearLineAndAFailingStatus)
+{
+    korvtest::NoCollector absent;
+
+    ProgramRun run = RunStat("");
+
+    EXPECT_EQ(run.status, 1);
+    EXPECT_EQ(run.out, "");
+    EXPECT_THAT(run.err, ::testing::HasSubstr(
+                             "Failed to connect to socket: [/tmp/korvsnmpcd.sock]"));  // the library's
+    EXPECT_THAT(Lines(run.err).back(),
+                ::testing::Eq("korvsnmp-stat: no statistics from the collector on /tmp/korvsnmpcd.sock"));
+}
+
+TEST(KorvsnmpStatProgram, BadCommandLineExitsWithUsage)
+{
+    ProgramRun run = RunStat("--format xml");
+    EXPECT_EQ(run.status, 2);
+    EXPECT_THAT(run.err, ::testing::StartsWith("korvsnmp-stat: unknown format \"xml\"\n\nUsage:"));
 }
 
 }  // namespace
