@@ -11,8 +11,6 @@ install(TARGETS korvsnmp korvplatform korvplatform_headers EXPORT korvsnmpTarget
 install(DIRECTORY include/korvsnmp DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
 file(GLOB korvplatform_headers_files ${PROJECT_SOURCE_DIR}/platform/korv_*.h)
 install(FILES ${korvplatform_headers_files} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/korvplatform)
-install(FILES platform/standin/korv_standin.h
-  DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/korvplatform/standin)
 
 install(EXPORT korvsnmpTargets NAMESPACE korvsnmp:: DESTINATION ${korvsnmp_cmake_dir})
 configure_package_config_file(cmake/korvsnmpConfig.cmake.in

@@ -11,7 +11,7 @@
 
 #include "korv_standin.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
-#include "nothrow_allocation.h"
+#include "allocation_failure.h"
 #include "syslog_capture.h"
 
 namespace {
