@@ -35,6 +35,7 @@ struct Outcome {
     Result result = Result::True;
     std::set<std::string> members;
     std::vector<std::string> messages;
+    Json::Value value{};  // the result itself; not compared
 };
 
 std::ostream &operator<<(std::ostream &out, const Outcome &outcome)
@@ -166,6 +167,7 @@ protected:
             (*seam)->Stop();
         for (const std::string &member : result.getMemberNames())
             outcome.members.insert(member);
+        outcome.value = result;
         static const std::regex kPrefix("^(\\w+):[0-9]+ ");
         for (const korvtest::LogEntry &entry : korvtest::LoggedMessages())
             outcome.messages.push_back(std::regex_replace(entry.text, kPrefix, "$1 "));
@@ -205,6 +207,7 @@ TEST_F(FaultSweep, EveryPlatformCallFailedInTurn)
         EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
     }
     EXPECT_GT(cases, 50);
+    std::printf("[ sweep    ] %d platform calls failed in turn\n", cases);
 }
 
 TEST_F(FaultSweep, EveryAllocationFailedInTurn)
@@ -248,6 +251,123 @@ TEST_F(FaultSweep, EveryAllocationFailedInTurn)
     EXPECT_GT(thrown, 0);
     std::printf("[ sweep    ] %ld allocations: %d in the platform, %d thrown through the library\n",
                 allocations, platformCalls, thrown);
+}
+
+// The devices of a result section: "network" records, or "disk" records.
+std::set<std::string> Devices(const Json::Value &records)
+{
+    std::set<std::string> devices;
+    for (const Json::Value &record : records)
+        devices.insert(record["device"].asString());
+    return devices;
+}
+
+struct MalformedCase {
+    const char *name;
+    void (*arrange)(korvstandin::HostDescription &host, Json::Value &data);
+    Outcome expected;
+    void (*check)(const Json::Value &result);  // may be null
+};
+
+Json::Value Traffic(const std::string &device)
+{
+    Json::Value record(Json::objectValue);
+    record["device"] = device;
+    record["rx"] = 1;
+    record["tx"] = 2;
+    return record;
+}
+
+korvstandin::NetInterface *Find(korvstandin::HostDescription &host, korvstandin::NetRole role)
+{
+    for (korvstandin::NetInterface &entry : host.interfaces)
+        if (entry.role == role)
+            return &entry;
+    return nullptr;
+}
+
+const MalformedCase kMalformed[] = {
+    {"NameFillsItsFieldWithoutNul",
+     [](korvstandin::HostDescription &host, Json::Value &data) {
+         host.unterminatedFields = true;
+         host.interfaces.push_back({"abcdefghijklmnop"});
+         data["Network"].append(Traffic("abcdefghijklmnop"));
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_EQ(Devices(result["network"]).count("abcdefghijklmnop"), 1u); }},
+    {"MoreThan32Interfaces",
+     [](korvstandin::HostDescription &host, Json::Value &data) {
+         for (int i = 0; i < 40; ++i) {
+             host.interfaces.push_back({"x" + std::to_string(100 + i)});
+             data["Network"].append(Traffic("x" + std::to_string(100 + i)));
+         }
+         host.interfaceCountClaim = static_cast<int>(host.interfaces.size());
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_LE(result["network"].size(), 1u + 32u + 1u + 1u); }},
+    {"MemberCountBeyondSlots",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         Find(host, korvstandin::NetRole::Aggregation)->memberCountClaim = 1000;
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_EQ(Devices(result["network"]).count("bond0"), 1u); }},
+    {"MemberCountNegative",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         Find(host, korvstandin::NetRole::Aggregation)->memberCountClaim = -2;
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_EQ(Devices(result["network"]).count("bond0"), 0u); }},
+    {"DeviceCountBeyondItsBlock",
+     [](korvstandin::HostDescription &host, Json::Value &) { host.usb.countClaim = 1000; },
+     {Result::True, kAllMembers, {}},
+     nullptr},
+    {"DeviceListSizeNegative",
+     [](korvstandin::HostDescription &host, Json::Value &) { host.esata.neededClaim = -8; },
+     {Result::False, kUpToDisk, {"fill_in_current_disk_io Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE"}},
+     nullptr},
+    {"FlashCacheWithoutSpacePath",
+     [](korvstandin::HostDescription &host, Json::Value &) { host.flashCaches[0].spacePath.reset(); },
+     {Result::True, kAllMembers, {}},
+     nullptr},
+    {"FlashCacheWithoutVolumePath",
+     [](korvstandin::HostDescription &host, Json::Value &) { host.flashCaches[0].volumePath.reset(); },
+     {Result::True, kAllMembers, {}},
+     nullptr},
+    {"NullErrorFile",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         host.nullErrorFile = true;
+         korvstandin::SetFault(Op::KLIBCSzHashSetValue, Fault::Fail, 0x0042, korvstandin::Calls::Only(1));
+     },
+     {Result::True, kAllMembers, {"fill_in_current_disk_io KLIBCSzHashSetValue failed[0x0042 :4]"}},
+     nullptr},
+    {"LunSuccessNotBoolean",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         host.lunAnswer = korvstandin::LunAnswer::SuccessNotBoolean;
+     },
+     {Result::True, kAllMembers, {"fill_in_current_lun_io Failed to list LUNs"}},
+     nullptr},
+    {"LunsNotAnArray",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         host.lunAnswer = korvstandin::LunAnswer::LunsNotArray;
+     },
+     {Result::True, kAllMembers, {"fill_in_current_lun_io LUNs json data not found"}},
+     [](const Json::Value &result) { EXPECT_EQ(result["lun"][0]["lun_name"], result["lun"][0]["uuid"]); }},
+};
+
+TEST_F(FaultSweep, MalformedPlatformAnswers)
+{
+    const korvexample::Appliance wellFormed = appliance_;
+    for (const MalformedCase &c : kMalformed) {
+        SCOPED_TRACE(c.name);
+        appliance_ = wellFormed;
+        Describe();
+        c.arrange(korvstandin::Host(), appliance_.reply["data"]);
+        const Outcome outcome = Run();
+        EXPECT_EQ(outcome, c.expected);
+        if (c.check != nullptr)
+            c.check(outcome.value);
+        EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
+    }
 }
 
 }  // namespace
