@@ -6,6 +6,7 @@
 
 #include <cstdlib>
 #include <fstream>
+#include <sstream>
 #include <string>
 
 #include <gmock/gmock.h>
@@ -94,6 +95,25 @@ TEST_F(HostFileTest, WrittenDescriptionReadsBackTheSame)
     std::string error;
     ASSERT_TRUE(korvstandin::ParseHostDescription(text, read, error)) << error;
     EXPECT_EQ(korvstandin::HostFileText(read), text);
+}
+
+TEST_F(HostFileTest, LargeApplianceExampleFilesMatch)
+{
+    std::ifstream replyFile(KORVSNMP_EXAMPLES_DIR "/large-appliance.reply.json");
+    std::stringstream replyText;
+    replyText << replyFile.rdbuf();
+    const Json::Value reply = korvtest::ParseJson(replyText.str());
+    std::ifstream hostFile(KORVSNMP_EXAMPLES_DIR "/large-appliance.host.json");
+    std::stringstream hostText;
+    hostText << hostFile.rdbuf();
+    UseHostFile(hostText.str());
+
+    Json::Value result;
+    ASSERT_TRUE(SNMPParseReplyData(Json::Value(Json::objectValue), reply, result));
+    EXPECT_EQ(result["disk"]["disk"].size(), 72u);
+    EXPECT_EQ(result["network"].size(), 1u + 30u + 2u + 1u);  // total, listed, aggregations, PPPoE
+    EXPECT_EQ(result["lun"][511]["lun_name"].asString(), "LUN-512");
+    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
 }
 
 struct BadFile {
