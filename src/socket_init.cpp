@@ -6,12 +6,13 @@
 #include <cstring>
 
 #include "korvsnmp/transmitor.h"
-#include "log.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unit_log.h"
 
 namespace {
 
 constexpr char kLogUnit[] = "socket_init";
-constexpr char kCollectorSocketPath[] = "/tmp/korvsnmpcd.sock";
+using korvproto::kCollectorSocketPath;
 
 static_assert(sizeof kCollectorSocketPath <= sizeof(sockaddr_un::sun_path),
               "the socket path fits the address");

@@ -1,18 +1,16 @@
 // The collector client object: request and reply frames, whole exchanges,
 // and the collector control requests.
-#include <arpa/inet.h>
 #include <sys/select.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <cstdint>
-#include <cstring>
 
 #include <json/reader.h>
-#include <json/writer.h>
 
 #include "korvsnmp/transmitor.h"
-#include "log.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unit_log.h"
 
 namespace {
 
@@ -20,7 +18,7 @@ constexpr char kLogUnit[] = "transmitor";
 
 constexpr timeval kWritableWait = {10, 500000};
 constexpr timeval kReadableWait = {90, 0};
-constexpr size_t kLengthPrefixSize = 4;
+constexpr size_t kLengthPrefixSize = korvproto::kFramePrefixBytes;
 constexpr size_t kReplyReadSize = 1024;
 
 constexpr char kControlHostName[] = "localhost";
@@ -68,15 +66,6 @@ bool SendWhole(int fd, const void *data, size_t size)
     return send(fd, data, size, MSG_NOSIGNAL) == static_cast<ssize_t>(size);
 }
 
-// A one-line rendering of a value, for log messages.
-std::string ToText(const Json::Value &value)
-{
-    std::string text = Json::FastWriter().write(value);
-    if (!text.empty() && text.back() == '\n')
-        text.pop_back();
-    return text;
-}
-
 bool IsSuccessReply(const Json::Value &reply)
 {
     if (!reply.isObject())
@@ -93,18 +82,18 @@ bool SendControlRequest(const Json::Value &request)
 
     if (transmitor.Transmit(request) == -1) {
         KORVSNMP_LOG(LOG_ERR, "Failed to send request to korvsnmpcd, request: [%s]",
-                     ToText(request).c_str());
+                     korvproto::CompactJson(request).c_str());
         return false;
     }
     if (transmitor.GetDataJson(reply) == -1) {
         KORVSNMP_LOG(LOG_ERR, "Failed to get response from korvsnmpcd, request: [%s]",
-                     ToText(request).c_str());
+                     korvproto::CompactJson(request).c_str());
         return false;
     }
     if (IsSuccessReply(reply))
         return true;
-    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]", ToText(request).c_str(),
-                 ToText(reply).c_str());
+    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]", korvproto::CompactJson(request).c_str(),
+                 korvproto::CompactJson(reply).c_str());
     return false;
 }
 
@@ -206,12 +195,10 @@ int Transmitor::TransmitData(const Json::Value &request)
         return -1;
     }
 
-    // The frame carries the text and its NUL; the writer's line feed is part of the text.
-    const std::string text = Json::FastWriter().write(request);
-    const uint32_t frameLength = static_cast<uint32_t>(std::strlen(text.c_str()) + 1);
-    const uint32_t prefix = htonl(frameLength);
-    if (!SendWhole(socketFd, &prefix, kLengthPrefixSize) ||
-        !SendWhole(socketFd, text.c_str(), frameLength)) {
+    // The prefix and the text (with its NUL) go out in one call each.
+    const std::string frame = korvproto::EncodeRequestFrame(request);
+    if (!SendWhole(socketFd, frame.data(), kLengthPrefixSize) ||
+        !SendWhole(socketFd, frame.data() + kLengthPrefixSize, frame.size() - kLengthPrefixSize)) {
         KORVSNMP_LOG(LOG_ERR, "Failed to send command.");
         CloseConnection(socketFd);
         return -1;
@@ -249,9 +236,7 @@ int Transmitor::ReceiveData()
         CloseConnection(socketFd);
         return -1;
     }
-    uint32_t networkLength;
-    std::memcpy(&networkLength, prefix, sizeof networkLength);
-    const int32_t length = static_cast<int32_t>(ntohl(networkLength));
+    const int32_t length = static_cast<int32_t>(korvproto::DecodeFramePrefix(prefix));
     if (length <= 0)  // no body
         return 0;
 

@@ -1,6 +1,5 @@
 #include "test_collector.h"
 
-#include <arpa/inet.h>
 #include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
@@ -53,16 +52,10 @@ bool ReadExactly(int fd, int stopFd, size_t count, std::string &into)
 
 std::string FrameClaiming(uint32_t length, std::string_view body)
 {
-    uint32_t prefix = htonl(length);
-    std::string frame(reinterpret_cast<const char *>(&prefix), sizeof prefix);
-    frame.append(body);
-    return frame;
+    return korvproto::EncodeFramePrefix(length).append(body);
 }
 
-std::string Frame(std::string_view body)
-{
-    return FrameClaiming(static_cast<uint32_t>(body.size()), body);
-}
+std::string Frame(std::string_view body) { return korvproto::EncodeFrame(body); }
 
 SocketPathLock::SocketPathLock() : lockFd_(open(kLockPath, O_RDWR | O_CREAT | O_CLOEXEC, 0666))
 {
@@ -147,11 +140,10 @@ void TestCollector::Handle(int connection, const Answer &answer)
     std::string received;
     if (answer.readRequest) {
         std::string prefix;
-        if (ReadExactly(connection, stopPipe_[0], 4, prefix)) {
-            uint32_t length;
-            std::memcpy(&length, prefix.data(), sizeof length);
+        if (ReadExactly(connection, stopPipe_[0], korvproto::kFramePrefixBytes, prefix)) {
             received = prefix;
-            ReadExactly(connection, stopPipe_[0], ntohl(length), received);
+            ReadExactly(connection, stopPipe_[0], korvproto::DecodeFramePrefix(prefix.data()),
+                        received);
         } else {
             received = prefix;
         }

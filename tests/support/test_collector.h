@@ -17,9 +17,11 @@
 #include <thread>
 #include <vector>
 
+#include "protocol/collector_protocol.h"
+
 namespace korvtest {
 
-inline constexpr char kCollectorSocketPath[] = "/tmp/korvsnmpcd.sock";
+using korvproto::kCollectorSocketPath;
 
 // A reply frame: the 4-byte big-endian length of `body`, then `body`.
 std::string Frame(std::string_view body);
