@@ -16,10 +16,12 @@
 
 #include <json/value.h>
 
+#include "protocol/collector_socket_path.h"
+
 namespace korvproto {
 
 // Where the collector listens; the library's connections always go here.
-inline constexpr char kCollectorSocketPath[] = "/tmp/korvsnmpcd.sock";
+inline constexpr char kCollectorSocketPath[] = KORVPROTO_COLLECTOR_SOCKET_PATH;
 
 constexpr size_t kFramePrefixBytes = 4;
 // No request comes near this; the collector refuses a longer claim at once.
