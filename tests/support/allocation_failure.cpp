@@ -1,6 +1,5 @@
 #include "allocation_failure.h"
 
-#include <atomic>
 #include <cstddef>
 #include <cstdlib>
 #include <new>
@@ -8,42 +7,27 @@
 namespace korvtest {
 namespace {
 
-// Non-throwing calls left before the failing one; 0 when none is armed.
-std::atomic<int> gNothrowToFailure{0};
-// Allocations of any form left before the failing one; 0 when none is armed.
-std::atomic<long> gAnyToFailure{0};
-std::atomic<bool> gFailed{false};
-std::atomic<bool> gFailedNothrow{false};
-std::atomic<bool> gCounting{false};
-std::atomic<long> gCount{0};
+// Allocations left before the failing one, per seam; 0 when none is armed.
+thread_local long tNothrowLeft = 0;
+thread_local long tThrowingLeft = 0;
+thread_local long tAnyLeft = 0;
+thread_local bool tFailed = false;
+thread_local bool tFailedNothrow = false;
+thread_local bool tCounting = false;
+thread_local long tCount = 0;
 
-bool CountDown(std::atomic<long> &left)
-{
-    long now = left.load();
-    while (now > 0 && !left.compare_exchange_weak(now, now - 1)) {
-    }
-    return now == 1;
-}
+// Counts down an armed seam; true on its chosen allocation.
+bool Due(long &left) { return left > 0 && --left == 0; }
 
-bool CountDown(std::atomic<int> &left)
-{
-    int now = left.load();
-    while (now > 0 && !left.compare_exchange_weak(now, now - 1)) {
-    }
-    return now == 1;
-}
-
-// Whether this allocation is the one to fail.
 bool FailThisAllocation(bool nothrow)
 {
-    if (gCounting)
-        ++gCount;
-    bool fail = CountDown(gAnyToFailure);
-    if (nothrow && CountDown(gNothrowToFailure))
-        fail = true;
+    if (tCounting)
+        ++tCount;
+    bool fail = Due(tAnyLeft);
+    fail = Due(nothrow ? tNothrowLeft : tThrowingLeft) || fail;
     if (fail) {
-        gFailed = true;
-        gFailedNothrow = nothrow;
+        tFailed = true;
+        tFailedNothrow = nothrow;
     }
     return fail;
 }
@@ -52,46 +36,55 @@ void *Allocate(std::size_t size)
 {
     if (FailThisAllocation(false))
         throw std::bad_alloc();
-    void *block = std::malloc(size ? size : 1);
-    if (block == nullptr)
-        throw std::bad_alloc();
-    return block;
+    if (void *block = std::malloc(size == 0 ? 1 : size))
+        return block;
+    throw std::bad_alloc();
 }
 
 void *AllocateOrNull(std::size_t size) noexcept
 {
     if (FailThisAllocation(true))
         return nullptr;
-    return std::malloc(size ? size : 1);
+    return std::malloc(size == 0 ? 1 : size);
 }
 
 }  // namespace
 
-NothrowAllocationFailure::NothrowAllocationFailure(int nth) { gNothrowToFailure = nth; }
-NothrowAllocationFailure::~NothrowAllocationFailure() { gNothrowToFailure = 0; }
+NothrowAllocationFailure::NothrowAllocationFailure(int nth) { tNothrowLeft = nth; }
+NothrowAllocationFailure::~NothrowAllocationFailure() { tNothrowLeft = 0; }
+
+ThrowingAllocationFailure::ThrowingAllocationFailure(int nth)
+{
+    tThrowingLeft = nth;
+    tFailed = false;
+}
+ThrowingAllocationFailure::~ThrowingAllocationFailure() { tThrowingLeft = 0; }
+bool ThrowingAllocationFailure::Triggered() const { return tFailed; }
 
 AllocationFailure::AllocationFailure(long nth)
 {
-    gFailed = false;
-    gFailedNothrow = false;
-    gAnyToFailure = nth;
+    tFailed = false;
+    tFailedNothrow = false;
+    tAnyLeft = nth;
 }
 AllocationFailure::~AllocationFailure() { Stop(); }
-void AllocationFailure::Stop() { gAnyToFailure = 0; }
-bool AllocationFailure::Failed() const { return gFailed; }
-bool AllocationFailure::FailedNothrow() const { return gFailed && gFailedNothrow; }
+void AllocationFailure::Stop() { tAnyLeft = 0; }
+bool AllocationFailure::Failed() const { return tFailed; }
+bool AllocationFailure::FailedNothrow() const { return tFailed && tFailedNothrow; }
 
 AllocationCount::AllocationCount()
 {
-    gCount = 0;
-    gCounting = true;
+    tCount = 0;
+    tCounting = true;
 }
 AllocationCount::~AllocationCount() { Stop(); }
-void AllocationCount::Stop() { gCounting = false; }
-long AllocationCount::Count() const { return gCount; }
+void AllocationCount::Stop() { tCounting = false; }
+long AllocationCount::Count() const { return tCount; }
 
 }  // namespace korvtest
 
+// Memory from malloc and back to free, every form of delete included, so
+// that the sanitizer's own operators never see a block of ours.
 void *operator new(std::size_t size) { return korvtest::Allocate(size); }
 void *operator new[](std::size_t size) { return korvtest::Allocate(size); }
 void *operator new(std::size_t size, const std::nothrow_t &) noexcept
