@@ -11,6 +11,7 @@
 
 #include "korv_standin.h"
 #include "live_host.h"
+#include "platform_test.h"
 
 namespace {
 
@@ -19,10 +20,11 @@ using korvstandin::HostDescription;
 using korvstandin::NetRole;
 using ::testing::ElementsAre;
 
-class LiveHostTest : public ::testing::Test {
+class LiveHostTest : public korvtest::PlatformTest {
 protected:
     void SetUp() override
     {
+        PlatformTest::SetUp();
         char pattern[] = "/tmp/korvsnmp-live-XXXXXX";
         ASSERT_NE(mkdtemp(pattern), nullptr);
         root_ = pattern;
@@ -31,6 +33,7 @@ protected:
     {
         fs::remove_all(root_);
         korvstandin::Reset();
+        PlatformTest::TearDown();
     }
 
     void Write(const std::string &path, const std::string &text)

@@ -8,6 +8,7 @@
 #include <gtest/gtest.h>
 
 #include "korv_standin.h"
+#include "platform_test.h"
 
 namespace {
 
@@ -15,15 +16,7 @@ using korvstandin::Fault;
 using korvstandin::Host;
 using korvstandin::Op;
 
-class StandinTest : public ::testing::Test {
-protected:
-    void SetUp() override { korvstandin::Reset(); }
-    void TearDown() override
-    {
-        EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
-        korvstandin::Reset();
-    }
-};
+using StandinTest = korvtest::PlatformTest;
 
 TEST_F(StandinTest, ListsAreHandedOutInOrderAndReleasedByTheirHead)
 {
@@ -103,18 +96,24 @@ TEST_F(StandinTest, VlanRecordIsWrittenOnlyForAVlan)
     EXPECT_STREQ(vlan.name, "vlan5");
 }
 
-TEST_F(StandinTest, JournalRecordsEachCallWithItsArguments)
-{
-    korvstandin::SetJournal(true);
-    char name[16];
-    KORVPPPoeIntfGet(name, sizeof name);
-    Json::Value response;
-    KORV::APIRunner::Exec(response, "KORV.Core.ISCSI.LUN", 1, "list", Json::Value(), "admin");
+struct CallsCase {
+    korvstandin::Calls calls;
+    std::vector<bool> fails;  // calls 1 to 4
+};
 
-    EXPECT_THAT(korvstandin::Journal(),
-                ::testing::ElementsAre("KORVPPPoeIntfGet(16)",
-                                       "KORV::APIRunner::Exec(KORV.Core.ISCSI.LUN, 1, list, null, admin)"));
-    EXPECT_TRUE(response["success"].asBool());
+class StandinFaultCalls : public korvtest::PlatformTestWithParam<CallsCase> {};
+
+TEST_P(StandinFaultCalls, FaultHitsTheChosenCalls)
+{
+    Host().physMemSize = 64;
+    korvstandin::SetFault(Op::KLIBSystemPhysMemSizeGet, Fault::Fail, 0x77, GetParam().calls);
+    for (bool fails : GetParam().fails)
+        EXPECT_EQ(KLIBSystemPhysMemSizeGet(), fails ? 0u : 64u);
 }
+
+INSTANTIATE_TEST_SUITE_P(Calls, StandinFaultCalls,
+                         ::testing::Values(CallsCase{korvstandin::Calls::Every(), {true, true, true, true}},
+                                           CallsCase{korvstandin::Calls::Only(2), {false, true, false, false}},
+                                           CallsCase{korvstandin::Calls::From(3), {false, false, true, true}}));
 
 }  // namespace
