@@ -20,6 +20,7 @@
 #include "block_nodes.h"
 #include "korv_standin.h"
 #include "korvsnmp/parse_data.h"
+#include "platform_test.h"
 #include "syslog_capture.h"
 
 namespace {
@@ -62,15 +63,6 @@ const std::set<std::string> kUpToNetwork = {"cpu", "memory", "network"};
 const std::set<std::string> kUpToDisk = {"cpu", "memory", "network", "disk=null"};
 const std::set<std::string> kUpToSpace = {"cpu", "memory", "network", "disk", "space=null"};
 
-// The failure messages as the library formats them, with the error the
-// stand-in reports for a failing call of `op`.
-std::string HexError(const char *format, Op op)
-{
-    char text[128];
-    std::snprintf(text, sizeof text, format, korvstandin::kOutOfMemoryError, static_cast<int>(op));
-    return text;
-}
-
 // The argument `index` of a journal entry "Name(a, b, c)".
 std::string JournalArgument(const std::string &entry, size_t index)
 {
@@ -87,7 +79,7 @@ Outcome FailedCallOutcome(Op op, const std::string &entry)
     switch (op) {
     case Op::KLIBNetGetInterfaceInfo:
         return {Result::False, kUpToNetwork,
-                {HexError("fill_in_current_network Failed to get net interface, errno=0x%X", op)}};
+                {"fill_in_current_network Failed to get net interface, errno=0xD01"}};
     case Op::DiskInfoEnum:
         return {Result::False, kUpToDisk, {"fill_in_current_disk_io Failed to enum disks"}};
     case Op::KORVEBoxInfoEnum:
@@ -100,8 +92,8 @@ Outcome FailedCallOutcome(Op op, const std::string &entry)
     case Op::KORVSpaceInfoEnum:
         return {Result::False, kUpToSpace, {"fill_in_current_space_io Failed to enum space info"}};
     case Op::KLIBCSzHashSetValue:
-        return {Result::True, kAllMembers,
-                {HexError("fill_in_current_disk_io KLIBCSzHashSetValue failed[0x%04X standin:%d]", op)}};
+        // The stand-in's last error: code, "standin" and the operation's index.
+        return {Result::True, kAllMembers, {"fill_in_current_disk_io KLIBCSzHashSetValue failed[0x0D01 standin:4]"}};
     case Op::KLIBCFileGetSectionValue:
         return {Result::True, kAllMembers,
                 {"fill_in_current_disk_io Fail to get text [volume:" + JournalArgument(entry, 2) + "]"}};
@@ -117,10 +109,11 @@ Outcome FailedCallOutcome(Op op, const std::string &entry)
 const Op kListOperations[] = {Op::DiskInfoEnum, Op::KORVEBoxInfoEnum, Op::KORVSpaceInfoEnum,
                               Op::KORVFlashCacheConfigGet};
 
-class FaultSweep : public ::testing::Test {
+class FaultSweep : public korvtest::PlatformTest {
 protected:
     void SetUp() override
     {
+        PlatformTest::SetUp();
         const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
         std::string whyNot;
         if (!nodes_.Make(static_cast<size_t>(shape.spaces), whyNot))
@@ -136,7 +129,11 @@ protected:
         for (const std::string &entry : korvstandin::Journal())
             journal_[entry.substr(0, entry.find('('))].push_back(entry);
     }
-    void TearDown() override { korvstandin::Reset(); }
+    void TearDown() override
+    {
+        PlatformTest::TearDown();
+        korvstandin::Reset();
+    }
 
     void Describe()
     {

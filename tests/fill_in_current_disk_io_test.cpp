@@ -138,20 +138,6 @@ TEST_F(DiskInternalNames, MissingTextsReadAsEmpty)
                             missing("dedicated_ssd_cache"), missing("volume_disk"),
                             missing("volume_expansion"), missing("dedicated_ssd_cache")));
 
-    korvtest::ClearLog();
-    korvtest::DescribeEnglishTexts(Host());
-    korvstandin::SetFault(Op::KLIBCSzHashAlloc);
-    EXPECT_THAT(Names({"sda"}), ElementsAre("sda= 1/internal"));
-    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
-
-    korvstandin::SetFault(Op::KLIBCSzHashAlloc, Fault::None);
-    korvstandin::SetFault(Op::KLIBCSzHashSetValue, Fault::Fail, 0xAB);
-    Host().disks.resize(1);
-    korvtest::ClearLog();
-    EXPECT_THAT(Names({"sda"}), ElementsAre("sda= 1/internal"));
-    EXPECT_THAT(korvtest::LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, kUnit, "KLIBCSzHashSetValue failed[0x00AB standin:4]"),
-                            ::testing::_, ::testing::_));
 }
 
 TEST_F(DiskInternalNames, UnitsWithoutWrapperAreNotSearched)

@@ -45,26 +45,6 @@ TEST_F(StandinTest, ListsAreHandedOutInOrderAndReleasedByTheirHead)
     KORVEBoxInfoEnumFree(units);
 }
 
-TEST_F(StandinTest, FaultsGiveTheFailureResultAndThePlatformsLastError)
-{
-    korvstandin::SetFault(Op::KLIBNetGetInterfaceInfo, Fault::Fail, 0x1234);
-    KLIBNetInterfaceInfo records[2];
-    EXPECT_LE(KLIBNetGetInterfaceInfo(records, 2, 6), 0);
-    EXPECT_EQ(KLIBCErrGet(), 0x1234u);
-
-    korvstandin::SetFault(Op::KLIBCSzHashAlloc);
-    EXPECT_EQ(KLIBCSzHashAlloc(1024), nullptr);
-
-    korvstandin::SetFault(Op::DiskInfoEnum, Fault::FailLeavingList);
-    Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}};
-    DiskFilter filter{0x23};
-    DiskInfoList *disks = nullptr;
-    EXPECT_LT(DiskInfoEnum(&filter, &disks), 0);
-    ASSERT_NE(disks, nullptr);  // the caller must still release it
-    DiskInfoEnumFree(disks);
-    EXPECT_EQ(korvstandin::CallCount(Op::DiskInfoEnum), 1);
-}
-
 TEST_F(StandinTest, DeviceListComesInTwoCalls)
 {
     Host().usb.devices = {{"sdq", "USB Disk 1"}, {"sdr", "USB Disk 2"}};

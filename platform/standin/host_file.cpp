@@ -76,7 +76,7 @@ public:
             visit(Member(value_[i], path_ + "[" + std::to_string(i) + "]"));
     }
 
-    // A text of at most `limit` characters; `fieldSize` names the fixed field it must fit.
+    // A text of at most `limit` characters, without NUL; empty only when allowed.
     std::string Text(size_t limit, bool nonEmpty = false) const
     {
         if (!value_.isString())

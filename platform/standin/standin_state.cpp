@@ -68,6 +68,8 @@ constexpr const char *kOpNames[] = {
 static_assert(std::size(kOpNames) == static_cast<size_t>(Op::Count_), "one name per operation");
 
 constexpr char kFaultFile[] = "standin";
+// The last error of every call while the host file is unusable.
+constexpr unsigned int kBadHostFileError = 0x0D03;
 
 size_t Index(Op op) { return static_cast<size_t>(op); }
 
@@ -200,7 +202,7 @@ Fault EnterFault(Op op)
         ChooseProcessHost(state);
     const int call = ++state.calls[Index(op)];
     if (state.source == Source::BadHostFile) {
-        SetLastError(kOutOfMemoryError, kFaultFile, static_cast<int>(Index(op)));
+        SetLastError(kBadHostFileError, kFaultFile, static_cast<int>(Index(op)));
         return Fault::Fail;
     }
     const FaultSwitch &fault = state.faults[Index(op)];
