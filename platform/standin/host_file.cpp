@@ -22,6 +22,7 @@ constexpr Json::ArrayIndex kMaxInterfaces = 256;
 constexpr Json::ArrayIndex kMaxSpaces = 1024;
 constexpr Json::ArrayIndex kMaxLuns = 4096;
 constexpr Json::ArrayIndex kMaxListItems = 1024;
+constexpr Json::ArrayIndex kMaxSections = 64;
 constexpr size_t kMaxText = 1023;
 constexpr int kMaxNesting = 16;
 
@@ -269,6 +270,8 @@ void ReadDescription(const Member &root, HostDescription &host)
         const Member strings = root["strings"];
         if (!strings.Value().isObject())
             strings.Fail("not an object");
+        if (strings.Value().size() > kMaxSections)
+            strings.Fail("more than " + std::to_string(kMaxSections) + " sections");
         SectionedFile &file = host.files[kStringsFilePath];
         for (const std::string &section : strings.Value().getMemberNames()) {
             const Member texts(strings.Value()[section], "strings." + section);
