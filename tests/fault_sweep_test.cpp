@@ -7,7 +7,6 @@
 #include <map>
 #include <new>
 #include <optional>
-#include <regex>
 #include <set>
 #include <string>
 #include <vector>
@@ -62,6 +61,16 @@ const std::set<std::string> kAllMembers = {"cpu", "disk", "lun", "memory", "netw
 const std::set<std::string> kUpToNetwork = {"cpu", "memory", "network"};
 const std::set<std::string> kUpToDisk = {"cpu", "memory", "network", "disk=null"};
 const std::set<std::string> kUpToSpace = {"cpu", "memory", "network", "disk", "space=null"};
+
+// "<unit>:<line> <text>" as "<unit> <text>".
+std::string WithoutLine(const std::string &message)
+{
+    const size_t colon = message.find(':');
+    const size_t space = message.find(' ', colon);
+    if (colon == std::string::npos || space == std::string::npos)
+        return message;
+    return message.substr(0, colon) + message.substr(space);
+}
 
 // The argument `index` of a journal entry "Name(a, b, c)".
 std::string JournalArgument(const std::string &entry, size_t index)
@@ -166,9 +175,8 @@ protected:
         for (const std::string &member : result.getMemberNames())
             outcome.members.insert(member + (result[member].isNull() ? "=null" : ""));
         outcome.value = result;
-        static const std::regex kPrefix("^(\\w+):[0-9]+ ");
         for (const korvtest::LogEntry &entry : korvtest::LoggedMessages())
-            outcome.messages.push_back(std::regex_replace(entry.text, kPrefix, "$1 "));
+            outcome.messages.push_back(WithoutLine(entry.text));
         return outcome;
     }
 
