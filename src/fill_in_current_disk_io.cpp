@@ -11,10 +11,11 @@
 #include <new>
 #include <string>
 
+#include <korv_platform.h>
+
 #include "json_read.h"
-#include "platform_text.h"
-#include "korv_platform.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
+#include "platform_text.h"
 #include "protocol/unit_log.h"
 
 namespace {

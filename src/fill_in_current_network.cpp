@@ -8,11 +8,12 @@
 #include <string>
 #include <vector>
 
+#include <korv_core.h>
+#include <korv_net.h>
+
 #include "json_read.h"
-#include "platform_text.h"
-#include "korv_core.h"
-#include "korv_net.h"
 #include "korvsnmp/fill_in_current_network.h"
+#include "platform_text.h"
 #include "protocol/unit_log.h"
 
 namespace {
@@ -148,7 +149,9 @@ Json::Value Record(const std::string &device, const Counters &counters)
 
 }  // namespace
 
-bool KORVSNMP::FillInCurrentNetwork(const Json::Value &network, Json::Value &output)
+namespace KORVSNMP {
+
+bool FillInCurrentNetwork(const Json::Value &network, Json::Value &output)
 {
     if (!network.isArray()) {
         KORVSNMP_LOG(LOG_ERR, "ReplyNetwork is not array");
@@ -214,3 +217,5 @@ bool KORVSNMP::FillInCurrentNetwork(const Json::Value &network, Json::Value &out
     output = std::move(result);
     return true;
 }
+
+}  // namespace KORVSNMP
