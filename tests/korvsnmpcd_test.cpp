@@ -1,7 +1,6 @@
 // The reference collector: its parsers on fixed kernel texts, the rate
 // rules, the replies, and the built daemon itself, run on a socket of its own
 // and talked to over raw connections, hostile clients included.
-#include <arpa/inet.h>
 #include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
@@ -32,6 +31,7 @@
 #include "protocol/unique_fd.h"
 #include "rates.h"
 #include "reply.h"
+#include "json_text.h"
 #include "syslog_capture.h"
 
 extern char **environ;
@@ -39,7 +39,6 @@ extern char **environ;
 namespace {
 
 using korvsnmpcd::BlockCounters;
-using korvproto::RequestDecoder;
 using korvsnmpcd::Snapshot;
 using korvproto::UniqueFd;
 using korvtest::Logged;
@@ -296,10 +295,10 @@ TEST(KorvsnmpcdReply, StatisticsSections)
     EXPECT_EQ(data["System"].size(), 1u);
     EXPECT_EQ(data["System"][0]["idle"].asUInt(), 0u);
     EXPECT_EQ(data["Memory"][0]["total_real"].asUInt(), kUint32Max);
-    EXPECT_EQ(Json::FastWriter().write(data["Network"]), "[{\"device\":\"eth0\",\"rx\":7,\"tx\":8}]\n");
-    EXPECT_EQ(Json::FastWriter().write(data["DiskIO"]),
+    EXPECT_EQ(korvtest::JsonText(data["Network"]), "[{\"device\":\"eth0\",\"rx\":7,\"tx\":8}]");
+    EXPECT_EQ(korvtest::JsonText(data["DiskIO"]),
               "[{\"device\":\"sda\",\"read_access\":2,\"read_byte\":3,\"utilization\":1,"
-              "\"write_access\":4,\"write_byte\":5}]\n");
+              "\"write_access\":4,\"write_byte\":5}]");
     ASSERT_EQ(data["SpaceIO"].size(), 2u);
     EXPECT_EQ(data["SpaceIO"][0]["device"], "sda1");
     EXPECT_EQ(data["SpaceIO"][1]["device"], "total");
@@ -347,34 +346,6 @@ TEST_F(KorvsnmpcdAnswer, AnythingButAnObjectIsRefused)
                     ElementsAre(Logged(LOG_WARNING, "reply",
                                        "Refused a request that is not a JSON object")));
     }
-}
-
-std::string Prefix(uint32_t length)
-{
-    uint32_t networkOrder = htonl(length);
-    return std::string(reinterpret_cast<const char *>(&networkOrder), sizeof networkOrder);
-}
-
-TEST(KorvsnmpcdFraming, RequestGatheredFromAnyPieces)
-{
-    const std::string body("{\"request\":\"reload\"}\n\0", 22);
-    const std::string frame = Prefix(22) + body + "extra";
-    RequestDecoder decoder;
-    for (size_t i = 0; i + 1 < 4 + body.size(); ++i)
-        ASSERT_EQ(decoder.Feed(&frame[i], 1), RequestDecoder::State::kIncomplete) << i;
-    EXPECT_EQ(decoder.Feed(&frame[4 + body.size() - 1], 6), RequestDecoder::State::kComplete);
-    EXPECT_EQ(decoder.Body(), body);
-
-    for (uint32_t refused : {0u, korvproto::kMaxRequestBytes + 1, 0xffffffffu}) {
-        RequestDecoder bad;
-        std::string prefix = Prefix(refused);
-        EXPECT_EQ(bad.Feed(prefix.data(), prefix.size()), RequestDecoder::State::kInvalid) << refused;
-    }
-    RequestDecoder largest;
-    std::string prefix = Prefix(korvproto::kMaxRequestBytes);
-    EXPECT_EQ(largest.Feed(prefix.data(), prefix.size()), RequestDecoder::State::kIncomplete);
-
-    EXPECT_EQ(korvproto::EncodeFrame("{\"success\":true}"), Prefix(16) + "{\"success\":true}");
 }
 
 // ---------------------------------------------------------------- the daemon
@@ -458,17 +429,10 @@ std::string Exchange(const std::string &path, const std::string &frame)
     return reply.substr(4);
 }
 
-Json::Value Parse(const std::string &text)
-{
-    Json::Value value;
-    Json::Reader reader;
-    EXPECT_TRUE(reader.parse(text, value)) << text;
-    return value;
-}
-
 bool Answers(const std::string &path)
 {
-    Json::Value reply = Parse(Exchange(path, korvproto::EncodeRequestFrame(StatisticsRequest())));
+    const std::string frame = korvproto::EncodeRequestFrame(StatisticsRequest());
+    Json::Value reply = korvtest::ParseJson(Exchange(path, frame));
     return reply.isObject() && reply["data"].isObject() && reply["data"]["Memory"].isArray();
 }
 
@@ -592,7 +556,8 @@ protected:
 
 TEST_F(KorvsnmpcdDaemon, StatisticsReplyHasEverySection)
 {
-    Json::Value reply = Parse(Exchange(path_, korvproto::EncodeRequestFrame(StatisticsRequest())));
+    const std::string frame = korvproto::EncodeRequestFrame(StatisticsRequest());
+    Json::Value reply = korvtest::ParseJson(Exchange(path_, frame));
     const Json::Value &data = reply["data"];
     ASSERT_TRUE(data.isObject()) << reply;
     EXPECT_EQ(data["System"].size(), 1u);
@@ -641,15 +606,16 @@ TEST_F(KorvsnmpcdDaemon, ControlRequestsSucceedAndLogTheReason)
 
 TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDropped)
 {
-    EXPECT_EQ(Parse(Exchange(path_, Prefix(8) + "garbage!"))["success"], false);
+    const std::string garbage = korvproto::EncodeFramePrefix(8) + "garbage!";
+    EXPECT_EQ(korvtest::ParseJson(Exchange(path_, garbage))["success"], false);
 
     struct Case {
         const char *what;
         std::string bytes;
     } cases[] = {
         {"text without a frame", "GET / HTTP/1.0\r\n\r\n"},  // claims 0x47455420 bytes
-        {"oversize length claim", Prefix(0xffffffffu) + "{}"},
-        {"zero length", Prefix(0)},
+        {"oversize length claim", korvproto::EncodeFramePrefix(0xffffffffu) + "{}"},
+        {"zero length", korvproto::EncodeFramePrefix(0)},
     };
     for (const Case &c : cases) {
         UniqueFd fd = Connect(path_);
@@ -668,7 +634,7 @@ TEST_F(KorvsnmpcdDaemon, StalledClientsAreClosedAfterTheWaitWithoutHoldingUpOthe
     UniqueFd silent = Connect(path_);
     UniqueFd partial = Connect(path_);
     ASSERT_TRUE(silent.Valid() && partial.Valid());
-    ASSERT_TRUE(SendAll(partial.Get(), Prefix(1000) + "{\"resourc"));
+    ASSERT_TRUE(SendAll(partial.Get(), korvproto::EncodeFramePrefix(1000) + "{\"resourc"));
     Clock::time_point start = Clock::now();
 
     // A good client is served at once, while both stalled ones still hold their connections.
@@ -691,7 +657,7 @@ TEST_F(KorvsnmpcdDaemon, HundredsOfConnectionsInARowLeakNothing)
     size_t descriptors = OpenDescriptors(daemon_.Pid());
     const std::string frame = korvproto::EncodeRequestFrame(StatisticsRequest());
     for (int i = 0; i < 300; ++i)
-        ASSERT_TRUE(Parse(Exchange(path_, frame))["data"].isObject()) << "exchange " << i;
+        ASSERT_TRUE(korvtest::ParseJson(Exchange(path_, frame))["data"].isObject()) << "exchange " << i;
     // Clients that leave without waiting for their reply.
     for (int i = 0; i < 300; ++i) {
         UniqueFd fd = Connect(path_);
