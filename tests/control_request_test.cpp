@@ -63,6 +63,8 @@ ControlCase Refusal(const char *name, const std::string &reply)
     return {name, nullptr, Reply(reply), false, kReloadFrame, {Error(Refused(reply))}};
 }
 
+void PrintTo(const ControlCase &c, std::ostream *out) { *out << c.name; }
+
 class ControlRequestTest : public ::testing::TestWithParam<ControlCase> {};
 
 TEST_P(ControlRequestTest, FrameVerdictAndMessages)

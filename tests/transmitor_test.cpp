@@ -218,6 +218,8 @@ struct WaitCase {
     std::vector<std::string> messages;  // of this unit, in order
 };
 
+void PrintTo(const WaitCase &c, std::ostream *out) { *out << c.name; }
+
 class TransmitorWaitTest : public TransmitorTest, public ::testing::WithParamInterface<WaitCase> {};
 
 // A failed wait ends the exchange before any reply byte is read: the earlier
