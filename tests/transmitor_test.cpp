@@ -48,20 +48,6 @@ protected:
     void SetUp() override { korvtest::ClearLog(); }
 };
 
-TEST_F(TransmitorTest, RequestGoesOutAsLengthTextLineFeedAndNul)
-{
-    korvtest::TestCollector collector;
-    collector.Script({Frame("{}")});
-    Transmitor transmitor("host");
-
-    ASSERT_EQ(transmitor.Transmit(SampleRequest()), 0);
-
-    ASSERT_TRUE(collector.WaitForConnections(1));
-    const std::string text = "{\"resource\":[\"cpu\",\"disk\"]}\n";
-    EXPECT_EQ(collector.Requests().at(0), FrameClaiming(text.size() + 1, text + '\0'));
-    EXPECT_EQ(collector.Requests().at(0).size(), 4 + text.size() + 1);
-}
-
 struct ReplyCase {
     const char *name;
     std::string answer;
@@ -120,21 +106,6 @@ TEST_F(TransmitorTest, EmptyLengthLeavesTheConnectionOpenAndNoReply)
     EXPECT_EQ(transmitor.GetDataJson(value), -1);
     EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, "Error: wrong member data inside"),
                                               Logged(LOG_ERR, kUnit, "Error: wrong member data inside")));
-}
-
-TEST_F(TransmitorTest, DataIsReadBackAsTextAndAsJson)
-{
-    korvtest::TestCollector collector;
-    collector.Script({Frame(std::string("{\"data\":{\"time\":17}}\0", 21))});
-    Transmitor transmitor("host");
-    ASSERT_EQ(transmitor.Transmit(SampleRequest()), 0);
-
-    Json::Value reply;
-    ASSERT_EQ(transmitor.GetDataJson(reply), 0);
-    EXPECT_EQ(reply["data"]["time"].asInt(), 17);
-    std::string text;
-    ASSERT_EQ(transmitor.GetDataStr(text), 0);
-    EXPECT_EQ(text, transmitor.dataStr);
 }
 
 // Text that the reader refuses or gives up on stays, and is not converted.
