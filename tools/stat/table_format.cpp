@@ -180,10 +180,10 @@ std::vector<const Json::Value *> Elements(const Json::Value &array)
 
 // The records of `section` with the "total" ones last: the member "total" of
 // an object that holds its records under `list`, or the records of an array
-// whose "device" is "total".
+// whose "device" is "total". Another value is one record of its own.
 std::vector<const Json::Value *> TotalLast(const Json::Value &section, const char *list)
 {
-    if (!section.isObject() && !section.isArray())
+    if (!section.isArray() && !(section.isObject() && *list != '\0'))
         return {&section};
     std::vector<const Json::Value *> rows = Elements(section.isObject() ? section[list] : section);
     std::stable_partition(rows.begin(), rows.end(), [](const Json::Value *record) {
