@@ -4,6 +4,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <fstream>
@@ -13,9 +14,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <json/reader.h>
-
 #include "counters.h"
+#include "json_text.h"
 #include "openmetrics_format.h"
 #include "options.h"
 #include "table_format.h"
@@ -133,13 +133,6 @@ std::vector<std::string> Lines(const std::string &text)
     return lines;
 }
 
-Json::Value Parsed(const char *text)
-{
-    Json::Value value;
-    EXPECT_TRUE(Json::Reader().parse(text, value)) << text;
-    return value;
-}
-
 // Sets TZ for one scope, for local times that the test can spell out.
 class ScopedTimeZone {
 public:
@@ -171,7 +164,7 @@ private:
 // result has it first; members of unknown meaning last.
 TEST(KorvsnmpStatTables, EveryCounterTableHasOneColumnOrderAndTotalLast)
 {
-    const Json::Value result = Parsed(R"({
+    const Json::Value result = korvtest::ParseJson(R"({
         "network": [{"device": "total", "rx": 3072, "tx": 10}, {"device": "eth0", "rx": 3072, "tx": 10}],
         "disk": {"disk": [{"write_byte": 0, "read_byte": 1536, "utilization": 7, "type": "internal",
                            "display_name": "Disk 1", "device": "sda", "write_access": 2,
@@ -221,7 +214,7 @@ TEST(KorvsnmpStatTables, EveryCounterTableHasOneColumnOrderAndTotalLast)
 
 TEST(KorvsnmpStatTables, CpuAndMemoryInAFixedOrderWithBytesOnRequest)
 {
-    const Json::Value result = Parsed(R"({
+    const Json::Value result = korvtest::ParseJson(R"({
         "cpu": {"idle": 88, "iowait": 1, "nice": 0, "steal": 0, "system": 3, "user": 8, "zz": 1},
         "memory": {"avail_real": 1024, "avail_swap": 0, "buffer": 1, "cached": 2, "free_real": 3,
                    "memory_size": 4294967295, "total_real": 2048, "total_swap": 0},
@@ -248,7 +241,7 @@ TEST(KorvsnmpStatTables, CpuAndMemoryInAFixedOrderWithBytesOnRequest)
 TEST(KorvsnmpStatTables, ValuesOfUnexpectedShapesAreShownNotThrown)
 {
     const Json::Value result =
-        Parsed(R"({"cpu": 3, "lun": [1, {"uuid": [2]}], "space": "none", "nfs": null,
+        korvtest::ParseJson(R"({"cpu": 3, "lun": [1, {"uuid": [2]}], "space": "none", "nfs": null,
                    "network": {"device": "x"}, "disk": {"disk": 5, "total": true},
                    "time": 1e300})");
     std::ostringstream out;
@@ -284,7 +277,7 @@ TEST(KorvsnmpStatTables, ExactTextScalesKibibytesWithoutOverflow)
         {"\"7\"", Unit::PerSecond, ""},
     };
     for (const auto &[json, unit, expected] : cases)
-        EXPECT_EQ(korvstat::ExactText(Parsed(json), unit), expected) << json;
+        EXPECT_EQ(korvstat::ExactText(korvtest::ParseJson(json), unit), expected) << json;
 }
 
 TEST(KorvsnmpStatOpenMetrics, LabelValuesAreEscapedAndValidUtf8)
@@ -356,7 +349,7 @@ std::vector<std::string> ParsedSamples(const std::string &exposition)
 
 TEST(KorvsnmpStatOpenMetrics, TheParsersReadEveryNamedRecord)
 {
-    const Json::Value result = Parsed(R"({
+    const Json::Value result = korvtest::ParseJson(R"({
         "memory": {"total_real": 2048, "memory_size": 4294967295},
         "network": [{"device": "total", "rx": 6, "tx": 0}, {"device": "eth0", "rx": 3, "tx": 0},
                     {"device": "eth0", "rx": 3, "tx": 0}, {"device": "ppp0", "rx": "n/a"}],
@@ -408,7 +401,7 @@ TEST(KorvsnmpStatOpenMetrics, NothingButEofForAResultWithoutNumbers)
     const char *const cases[] = {"null", "[]", R"({"cpu": [1], "disk": 3, "time": "x"})"};
     for (const char *json : cases) {
         std::ostringstream out;
-        korvstat::WriteOpenMetrics(Parsed(json), out);
+        korvstat::WriteOpenMetrics(korvtest::ParseJson(json), out);
         EXPECT_EQ(out.str(), "# EOF\n") << json;
     }
 }
@@ -481,7 +474,8 @@ ProgramRun RunStat(const std::string &arguments, const std::string &environment 
     int errFd = mkstemp(pattern);
     close(errFd);
     const std::string command =
-        environment + " " + KORVSNMP_STAT_PATH + " " + arguments + " 2>" + pattern;
+        korvtest::RedirectedChildPrefix() + environment + " " + KORVSNMP_STAT_PATH + " " + arguments +
+        " 2>" + pattern;
     ProgramRun run{-1, "", ""};
     FILE *pipe = popen(command.c_str(), "r");
     if (pipe == nullptr)
@@ -577,6 +571,21 @@ TEST(KorvsnmpStatProgram, WatchRedrawsUntilInterrupted)
 {
     korvtest::TestCollector collector;
     collector.Script({korvtest::Frame(kCpuAndNfsReply)});
+    // The child's environment: ours, with the redirection to the test collector.
+    std::vector<std::string> variables = korvtest::RedirectedChildVariables();
+    for (char **variable = environ; *variable != nullptr; ++variable) {
+        const std::string entry = *variable;
+        const std::string key = entry.substr(0, entry.find('=') + 1);
+        if (std::none_of(variables.begin(), variables.end(),
+                         [&](const std::string &v) { return v.rfind(key, 0) == 0; }))
+            variables.push_back(entry);
+    }
+    std::vector<char *> envp;
+    for (std::string &variable : variables)
+        envp.push_back(variable.data());
+    envp.push_back(nullptr);
+    const char *const argv[] = {KORVSNMP_STAT_PATH, "--watch", "3600", "--resource", "nfs",
+                                "--compact", nullptr};
     int output[2];
     ASSERT_EQ(pipe(output), 0);
     const pid_t child = fork();
@@ -585,8 +594,7 @@ TEST(KorvsnmpStatProgram, WatchRedrawsUntilInterrupted)
         dup2(output[1], STDOUT_FILENO);
         close(output[0]);
         close(output[1]);
-        execl(KORVSNMP_STAT_PATH, KORVSNMP_STAT_PATH, "--watch", "3600", "--resource", "nfs",
-              "--compact", static_cast<char *>(nullptr));
+        execve(KORVSNMP_STAT_PATH, const_cast<char *const *>(argv), envp.data());
         _exit(127);
     }
     close(output[1]);

@@ -28,7 +28,7 @@ const std::vector<std::string> &KnownResources();
 // conflicting option, or a stray operand; `options` is then unspecified.
 bool ParseOptions(const std::vector<std::string> &arguments, Options &options, std::string &error);
 
-extern const char kUsage[];
+extern const std::string kUsage;
 
 }  // namespace korvstat
 

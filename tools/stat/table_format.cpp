@@ -7,9 +7,8 @@
 #include <string>
 #include <vector>
 
-#include <json/writer.h>
-
 #include "counters.h"
+#include "protocol/collector_protocol.h"
 
 namespace korvstat {
 namespace {
@@ -18,21 +17,13 @@ constexpr char kMissing[] = "-";
 constexpr char kColumnGap[] = "  ";
 constexpr char kTotal[] = "total";
 
-std::string Compact(const Json::Value &value)
-{
-    std::string text = Json::FastWriter().write(value);
-    if (!text.empty() && text.back() == '\n')
-        text.pop_back();
-    return text;
-}
-
 std::string CellText(const Json::Value &value)
 {
     if (value.isNull())
         return kMissing;
     if (value.isString())
         return value.asString();
-    return Compact(value);
+    return korvproto::CompactJson(value);
 }
 
 struct Cell {
