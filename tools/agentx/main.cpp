@@ -13,7 +13,7 @@
 #include <cstdlib>
 
 #include "agentx_handler.h"
-#include "options.h"
+#include "agentx_options.h"
 #include "sampler.h"
 
 namespace {

@@ -1,5 +1,5 @@
 // korvsnmp-agentx's command line.
-#include "options.h"
+#include "agentx_options.h"
 
 #include <cerrno>
 #include <cstdlib>

@@ -1,6 +1,6 @@
 // korvsnmp-agentx's command line.
-#ifndef KORVAGENTX_OPTIONS_H
-#define KORVAGENTX_OPTIONS_H
+#ifndef KORVAGENTX_AGENTX_OPTIONS_H
+#define KORVAGENTX_AGENTX_OPTIONS_H
 
 #include <cstdint>
 #include <string>
