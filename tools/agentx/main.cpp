@@ -103,6 +103,9 @@ int main(int argc, char **argv)
     init_agent(kAppName);
     const bool registered = korvagentx::RegisterSubtree(sampler);
     init_snmp(kAppName);
+    // Starting the library resets the ping interval; the reconnect timer reads it later.
+    netsnmp_ds_set_int(NETSNMP_DS_APPLICATION_ID, NETSNMP_DS_AGENT_AGENTX_PING_INTERVAL,
+                       static_cast<int>(options.pingSeconds));
     register_readfd(signalPipe[0], DrainSignalPipe, nullptr);
     sampler.Start();
 
