@@ -65,8 +65,25 @@ private:
 // A child process, stopped by its id (SIGTERM, then waited for).
 class Child {
 public:
-    Child(const std::vector<std::string> &argv, const std::string &output)
+    // Runs `argv` with this process's environment plus `variables`
+    // ("NAME=value", taking the place of a variable of the same name).
+    Child(const std::vector<std::string> &argv, const std::string &output,
+          const std::vector<std::string> &variables = {})
     {
+        std::vector<std::string> environment = variables;
+        for (char **variable = environ; *variable != nullptr; ++variable) {
+            const std::string entry = *variable;
+            const std::string name = entry.substr(0, entry.find('=') + 1);
+            bool replaced = false;
+            for (const std::string &own : variables)
+                replaced = replaced || own.compare(0, name.size(), name) == 0;
+            if (!replaced)
+                environment.push_back(entry);
+        }
+        std::vector<char *> envp;
+        for (std::string &entry : environment)
+            envp.push_back(entry.data());
+        envp.push_back(nullptr);
         posix_spawn_file_actions_t actions;
         posix_spawn_file_actions_init(&actions);
         posix_spawn_file_actions_addopen(&actions, 1, output.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
@@ -75,7 +92,7 @@ public:
         for (const std::string &arg : argv)
             args.push_back(const_cast<char *>(arg.c_str()));
         args.push_back(nullptr);
-        if (posix_spawn(&pid_, args[0], &actions, nullptr, args.data(), environ) != 0)
+        if (posix_spawn(&pid_, args[0], &actions, nullptr, args.data(), envp.data()) != 0)
             pid_ = -1;
         posix_spawn_file_actions_destroy(&actions);
     }
@@ -145,14 +162,15 @@ bool PollUntil(Predicate done)
     return done();
 }
 
-// Connections to the collector's socket path that are open now (listening
-// socket included), from the kernel's table.
+// Sockets on the test collector's path that are open now (listening socket
+// included), from the kernel's table.
 int CollectorSocketCount()
 {
+    const std::string &path = korvtest::PrivateCollectorPath();
     std::istringstream table(ReadFile("/proc/net/unix"));
     int count = 0;
     for (std::string line; std::getline(table, line);)
-        count += line.size() > 20 && line.compare(line.size() - 20, 20, korvtest::kCollectorSocketPath) == 0;
+        count += line.size() > path.size() && line.compare(line.size() - path.size(), path.size(), path) == 0;
     return count;
 }
 
@@ -316,7 +334,7 @@ protected:
         subagent_.emplace(std::vector<std::string>{KORVSNMP_AGENTX_PATH, "--agentx-socket", agentxSocket_,
                                                    "--interval", "3600", "--ping-interval", "1",
                                                    "--persistent-dir", scratch_.Path() + "/agentx-state"},
-                          SubagentLog());
+                          SubagentLog(), korvtest::RedirectedChildVariables());
     }
 
     std::string SubagentLog() const { return scratch_.Path() + "/agentx.out"; }
