@@ -23,9 +23,18 @@ constexpr char kWakeSample = 's';
 constexpr char kWakeStop = 'q';
 constexpr size_t kPppoeNameSize = 16;
 
-const char *const kResources[] = {"cpu", "memory", "network", "disk", "space", "lun", "nfs"};
-// The result member that each resource fills, in kResources' order.
-const char *const kMembers[] = {"cpu", "memory", "network", "disk", "space", "lun", "nfs"};
+// Each resource, the reply section that it needs and the result member
+// that it fills.
+struct Section {
+    const char *resource;
+    const char *replySection;
+    const char *member;
+};
+const Section kSections[] = {
+    {"cpu", "System", "cpu"},      {"memory", "Memory", "memory"}, {"network", "Network", "network"},
+    {"disk", "DiskIO", "disk"},    {"space", "SpaceIO", "space"},  {"lun", "iSCSI", "lun"},
+    {"nfs", "NFS", "nfs"},
+};
 
 Json::Value RequestFor(const char *resource)
 {
@@ -36,7 +45,7 @@ Json::Value RequestFor(const char *resource)
 
 // SNMPParseReplyData, with the JSON library's errors on values of unexpected
 // types kept in here.
-bool Assemble(const Json::Value &request, const Json::Value &reply, Json::Value &result)
+bool Assemble(const Json::Value &request, Json::Value &reply, Json::Value &result)
 {
     try {
         return SNMPParseReplyData(request, reply, result);
@@ -55,26 +64,28 @@ SampleOutcome TakeSample()
 {
     SampleOutcome outcome;
     Transmitor transmitor("localhost");
-    Json::Value request = RequestFor("all");
     Json::Value reply;
-    if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(reply) != 0)
+    if (transmitor.Transmit(RequestFor("all")) != 0 || transmitor.GetDataJson(reply) != 0)
         return outcome;
     outcome.replied = true;
-    Json::Value whole(Json::objectValue);
-    if (Assemble(request, reply, whole) && whole.isObject()) {
-        outcome.result = std::move(whole);
-        return outcome;
-    }
-    // Something is missing or malformed: take each section on its own, so that
-    // one bad section leaves the others in place and its own table empty.
     outcome.result = Json::Value(Json::objectValue);
-    for (size_t i = 0; i < std::size(kResources); ++i) {
+    Json::Value none;
+    Json::Value &data = reply.isObject() && reply["data"].isObject() ? reply["data"] : none;
+    const Json::Value *time = data.isObject() ? data.find("time", "time" + 4) : nullptr;
+    if (time != nullptr)
+        outcome.result["time"] = *time;
+    // Each section on its own, moved out of the reply: a section that is
+    // missing or that the library refuses leaves only its own table empty.
+    for (const Section &section : kSections) {
         Json::Value part(Json::objectValue);
-        Assemble(RequestFor(kResources[i]), reply, part);
-        if (part.isObject() && part.isMember(kMembers[i]))
-            outcome.result[kMembers[i]] = part[kMembers[i]];
-        if (part.isObject() && part.isMember("time"))
-            outcome.result["time"] = part["time"];
+        if (data.isObject() && data.isMember(section.replySection))
+            part["data"][section.replySection].swapPayload(data[section.replySection]);
+        if (time != nullptr)
+            part["data"]["time"] = *time;
+        Json::Value filled(Json::objectValue);
+        Assemble(RequestFor(section.resource), part, filled);
+        if (filled.isObject() && filled.isMember(section.member))
+            outcome.result[section.member].swapPayload(filled[section.member]);
     }
     return outcome;
 }
