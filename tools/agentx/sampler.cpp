@@ -3,6 +3,8 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <pthread.h>
+#include <signal.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -22,6 +24,12 @@ constexpr char kUnit[] = "sampler";
 constexpr char kWakeSample = 's';
 constexpr char kWakeStop = 'q';
 constexpr size_t kPppoeNameSize = 16;
+// Sent to the sampling thread on stop: it breaks a wait on the collector
+// (the library's select() fails with EINTR), so a stop never waits 90 s.
+constexpr int kInterruptSignal = SIGUSR2;
+constexpr auto kInterruptRepeat = std::chrono::milliseconds(50);
+
+void IgnoreInterrupt(int) {}
 
 // Each resource, the reply section that it needs and the result member
 // that it fills.
@@ -131,8 +139,15 @@ void Sampler::Start()
         syslog(LOG_ERR, "%s:%d Cannot create the wake-up pipe, errno=%d", kUnit, __LINE__, errno);
         wakeFds_[0] = wakeFds_[1] = -1;
     }
+    struct sigaction interrupt {};
+    interrupt.sa_handler = IgnoreInterrupt;  // no SA_RESTART: waits end with EINTR
+    sigaction(kInterruptSignal, &interrupt, nullptr);
     stopping_ = false;
-    thread_ = std::thread(&Sampler::Run, this);
+    running_ = true;
+    thread_ = std::thread([this] {
+        Run();
+        running_ = false;
+    });
 }
 
 void Sampler::Stop()
@@ -142,8 +157,14 @@ void Sampler::Stop()
         ssize_t ignored = write(wakeFds_[1], &kWakeStop, 1);
         (void)ignored;
     }
-    if (thread_.joinable())
+    if (thread_.joinable()) {
+        // The thread may be about to wait on the collector: repeat until it ends.
+        while (running_) {
+            pthread_kill(thread_.native_handle(), kInterruptSignal);
+            std::this_thread::sleep_for(kInterruptRepeat);
+        }
         thread_.join();
+    }
     for (int &fd : wakeFds_) {
         if (fd >= 0)
             close(fd);
