@@ -472,6 +472,19 @@ TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCounte
     EXPECT_EQ(count("The collector answers again"), 1u) << log;
 }
 
+TEST_F(AgentxUnderSnmpd, SigtermDuringAStalledExchangeStopsAtOnce)
+{
+    collector_->Script({"", false});  // the first sample stalls
+    const int idle = CollectorSocketCount();
+    StartSubagent();
+    ASSERT_TRUE(PollUntil([&] { return CollectorSocketCount() > idle; }));
+    ASSERT_TRUE(PollUntil([&] { return Get("korvSampleInterval.0") == "korvSampleInterval.0 = 3600\n"; }));
+
+    const auto start = Clock::now();
+    EXPECT_EQ(subagent_->Stop(), 0) << ReadFile(SubagentLog());
+    EXPECT_LT(Clock::now() - start, std::chrono::seconds(10));  // not the library's 90 s
+}
+
 TEST_F(AgentxUnderSnmpd, ARestartedSnmpdFindsTheSubagentRegisteredAgain)
 {
     collector_->Script({korvtest::Frame(korvtest::JsonText(LiveHostReply(1795000000, 3)))});
