@@ -313,24 +313,23 @@ TEST(KorvsnmpcdReply, StatisticsSections)
 class KorvsnmpcdAnswer : public ::testing::Test {
 protected:
     void SetUp() override { korvtest::ClearLog(); }
-    const std::string statistics_ = "{\"data\":{}}";
 };
 
 TEST_F(KorvsnmpcdAnswer, ControlAndStatisticsRequests)
 {
-    const std::string success = "{\"success\":true}";
-    EXPECT_EQ(korvsnmpcd::AnswerRequest(std::string("{\"request\":\"reload\"}\n\0", 22), statistics_),
-              success);
-    EXPECT_EQ(korvsnmpcd::AnswerRequest("{\"reason\":\"disk swap\",\"request\":\"history_mode\"}\n",
-                                        statistics_),
-              success);
+    using korvsnmpcd::RequestKind;
+    EXPECT_EQ(korvsnmpcd::ReadRequest(std::string("{\"request\":\"reload\"}\n\0", 22)),
+              RequestKind::kControl);
+    EXPECT_EQ(korvsnmpcd::ReadRequest("{\"reason\":\"disk swap\",\"request\":\"history_mode\"}\n"),
+              RequestKind::kControl);
+    EXPECT_EQ(korvsnmpcd::ControlReply(RequestKind::kControl), "{\"success\":true}");
     EXPECT_THAT(korvtest::LoggedMessages(),
                 ElementsAre(Logged(LOG_NOTICE, "reply",
                                    "Reload requested; nothing to reload, sampling goes on"),
                             Logged(LOG_NOTICE, "reply", "History mode requested, reason: [disk swap]")));
     for (const char *statisticsRequest :
          {"{\"resource\":[\"all\"]}\n", "{}", "{\"request\":\"other\"}", "{\"request\":7}"})
-        EXPECT_EQ(korvsnmpcd::AnswerRequest(statisticsRequest, statistics_), statistics_)
+        EXPECT_EQ(korvsnmpcd::ReadRequest(statisticsRequest), RequestKind::kStatistics)
             << statisticsRequest;
 }
 
@@ -339,14 +338,12 @@ TEST_F(KorvsnmpcdAnswer, AnythingButAnObjectIsRefused)
     const std::string deep(100000, '[');
     for (const std::string &body : {std::string("garbage"), std::string("[1,2]"), std::string("7"),
                                     std::string(""), std::string("{\"a\":"), deep}) {
-        korvtest::ClearLog();
-        EXPECT_EQ(korvsnmpcd::AnswerRequest(body, statistics_),
-                  "{\"error\":\"the request is not a JSON object\",\"success\":false}")
+        EXPECT_EQ(korvsnmpcd::ReadRequest(body), korvsnmpcd::RequestKind::kNotAnObject)
             << body.substr(0, 20);
-        EXPECT_THAT(korvtest::LoggedMessages(),
-                    ElementsAre(Logged(LOG_WARNING, "reply",
-                                       "Refused a request that is not a JSON object")));
     }
+    EXPECT_EQ(korvsnmpcd::ControlReply(korvsnmpcd::RequestKind::kNotAnObject),
+              "{\"error\":\"the request is not a JSON object\",\"success\":false}");
+    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());  // the server counts refusals
 }
 
 std::string Prefix(uint32_t length)
@@ -508,7 +505,7 @@ public:
     explicit Daemon(const std::string &socketPath, const char *interval = "0.05")
         : socketPath_(socketPath), logPath_(socketPath + ".log")
     {
-        std::vector<std::string> args = {KORVSNMPCD_PATH, "--socket", socketPath_,
+        std::vector<std::string> args = {KORVSNMPCD_PATH, "--foreground", "--socket", socketPath_,
                                          "--interval", interval, "--client-timeout",
                                          kClientTimeout};
         std::vector<char *> argv;

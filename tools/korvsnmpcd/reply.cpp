@@ -117,7 +117,7 @@ std::string StatisticsReplyText(const Rates &rates, const Snapshot &sample)
     return Compact(StatisticsReply(rates, sample));
 }
 
-std::string AnswerRequest(std::string_view body, const std::string &statisticsReply)
+RequestKind ReadRequest(std::string_view body)
 {
     while (!body.empty() && body.back() == '\0')
         body.remove_suffix(1);
@@ -134,24 +134,30 @@ std::string AnswerRequest(std::string_view body, const std::string &statisticsRe
         // The reader gives up on very deep nesting by throwing.
         errors = error.what();
     }
-    if (!parsed || !request.isObject()) {
-        KORVSNMPCD_LOG(LOG_WARNING, "Refused a request that is not a JSON object");
-        return Compact(Refusal("the request is not a JSON object"));
-    }
+    if (!parsed || !request.isObject())
+        return RequestKind::kNotAnObject;
 
     const Json::Value &object = request;
     const Json::Value &kind = object["request"];
     if (kind.isString() && kind.asString() == kReloadRequest) {
         KORVSNMPCD_LOG(LOG_NOTICE, "Reload requested; nothing to reload, sampling goes on");
-    } else if (kind.isString() && kind.asString() == kHistoryModeRequest) {
+        return RequestKind::kControl;
+    }
+    if (kind.isString() && kind.asString() == kHistoryModeRequest) {
         const Json::Value &reason = object["reason"];
         std::string text = reason.isString() ? reason.asString()
                            : reason.isNull() ? std::string()
                                              : Compact(reason);
         KORVSNMPCD_LOG(LOG_NOTICE, "History mode requested, reason: [%s]", text.c_str());
-    } else {
-        return statisticsReply;
+        return RequestKind::kControl;
     }
+    return RequestKind::kStatistics;
+}
+
+std::string ControlReply(RequestKind kind)
+{
+    if (kind == RequestKind::kNotAnObject)
+        return Compact(Refusal("the request is not a JSON object"));
     Json::Value success(Json::objectValue);
     success["success"] = true;
     return Compact(success);
