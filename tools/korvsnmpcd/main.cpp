@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "collector_log.h"
-#include "options.h"
+#include "command_line.h"
 #include "pid_file.h"
 #include "reply_file.h"
 #include "sampler.h"
@@ -115,6 +115,16 @@ int main(int argc, char **argv)
     openlog(kProgram, LOG_PID | (toStderr ? LOG_PERROR : 0), LOG_DAEMON);
     signal(SIGPIPE, SIG_IGN);
 
+    // The daemon detaches first: the signal descriptor and the poller must
+    // belong to the process that waits on them. The caller still returns
+    // only when the daemon is ready, with status 1 when it is not.
+    korvsnmpcd::UniqueFd ready;
+    if (options.detach) {
+        ready = Detach();
+        if (!ready.Valid())
+            return EXIT_FAILURE;
+    }
+
     std::unique_ptr<korvsnmpcd::StatisticsSource> source;
     if (!options.replayPath.empty()) {
         auto replay = std::make_unique<korvsnmpcd::ReplayFile>(options.replayPath);
@@ -128,12 +138,6 @@ int main(int argc, char **argv)
     if (!source)
         source = std::make_unique<korvsnmpcd::Sampler>();
 
-    korvsnmpcd::UniqueFd ready;
-    if (options.detach) {
-        ready = Detach();
-        if (!ready.Valid())
-            return EXIT_FAILURE;
-    }
     korvsnmpcd::PidFile pidFile;
     if (!options.pidFile.empty() && !pidFile.Create(options.pidFile))
         return EXIT_FAILURE;

@@ -1,6 +1,6 @@
 // korvsnmpcd's command line.
-#ifndef KORVSNMPCD_OPTIONS_H
-#define KORVSNMPCD_OPTIONS_H
+#ifndef KORVSNMPCD_COMMAND_LINE_H
+#define KORVSNMPCD_COMMAND_LINE_H
 
 #include <cstdio>
 #include <string>
