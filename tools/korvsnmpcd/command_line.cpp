@@ -118,6 +118,8 @@ bool ParseOptions(int argc, const char *const *argv, Options &options, std::stri
             ok = flag(options.foreground);
         } else if (name == "--help" || name == "-h") {
             ok = flag(options.help);
+        } else if (name == "--probe") {
+            ok = flag(options.probe);
         } else if (name == "--version") {
             ok = flag(options.version);
         } else {
@@ -149,6 +151,8 @@ void PrintUsage(FILE *to)
                  "  --daemon                  detach once the socket is listening\n"
                  "  --foreground              stay attached and log to stderr too\n"
                  "  --pidfile PATH            write the process id to PATH\n"
+                 "  --probe                   exit 0 when something listens on the socket path,\n"
+                 "                            1 when not; start nothing\n"
                  "  --version                 print the version and exit\n"
                  "  --help                    print this help and exit\n",
                  kDefaultSocketPath, kDefaultMaxConnections);

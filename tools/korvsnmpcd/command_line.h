@@ -15,6 +15,7 @@ struct Options {
     bool foreground = false;  // --foreground: log to stderr too
     bool help = false;
     bool version = false;
+    bool probe = false;       // only tell whether something listens on the socket path
     std::string pidFile;
     std::string replayPath;   // serve this file's reply instead of sampling
 };

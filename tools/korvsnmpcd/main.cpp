@@ -108,10 +108,14 @@ int main(int argc, char **argv)
         std::printf("%s %s\n", kProgram, KORVSNMPCD_VERSION);
         return EXIT_SUCCESS;
     }
+    if (options.probe)
+        return korvsnmpcd::SomethingListensOn(options.server.socketPath) ? EXIT_SUCCESS
+                                                                         : EXIT_FAILURE;
     if (options.detach)
         CloseInheritedDescriptors();
 
-    bool toStderr = options.foreground || isatty(STDERR_FILENO);
+    // A daemon's caller sees why it did not start; once detached, its stderr is /dev/null.
+    bool toStderr = options.foreground || options.detach || isatty(STDERR_FILENO);
     openlog(kProgram, LOG_PID | (toStderr ? LOG_PERROR : 0), LOG_DAEMON);
     signal(SIGPIPE, SIG_IGN);
 

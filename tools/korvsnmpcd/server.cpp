@@ -64,6 +64,16 @@ int MillisecondsUntil(Clock::time_point when, Clock::time_point now)
 
 }  // namespace
 
+bool SomethingListensOn(const std::string &path)
+{
+    sockaddr_un address;
+    if (!FillAddress(path, address)) {
+        errno = ENAMETOOLONG;
+        return false;
+    }
+    return SomeoneAnswers(address);
+}
+
 struct Server::Connection {
     UniqueFd fd;
     Clock::time_point deadline;

@@ -45,6 +45,10 @@ struct ServerOptions {
     std::chrono::milliseconds logPeriod{10000};
 };
 
+// Whether something accepts connections on the UNIX socket `path` (a
+// connect, closed at once); errno tells why not.
+bool SomethingListensOn(const std::string &path);
+
 class Server {
 public:
     explicit Server(ServerOptions options);
