@@ -3,11 +3,14 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <climits>
+#include <cstring>
 #include <fstream>
 #include <string>
 #include <thread>
@@ -107,6 +110,7 @@ TEST(KorvsnmpcdProgram, ExitStatusAndOutputOfTheCommandLine)
         {{"--version"}, 0, std::string("korvsnmpcd ") + KORVSNMP_PROJECT_VERSION + "\n"},
         // Without a terminal or --foreground, messages go to syslog only.
         {{"--replay", "/nonexistent/reply.json"}, 1, ""},
+        {{"--probe", "--socket", "/nonexistent/k.sock"}, 1, ""},  // nothing listens there
     };
     for (const Case &c : cases) {
         CollectorProcess program(KORVSNMPCD_PATH, c.args, log);
@@ -117,6 +121,21 @@ TEST(KorvsnmpcdProgram, ExitStatusAndOutputOfTheCommandLine)
     EXPECT_EQ(foreground.WaitForExit(), 1);
     EXPECT_THAT(foreground.Log(),
                 HasSubstr("Cannot read the reply to replay from [/nonexistent/r.json]"));
+}
+
+// A datagram socket bound to `path`, as a service manager's notification socket.
+int NotificationSocket(const std::string &path)
+{
+    unlink(path.c_str());
+    int fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
+    if (fd >= 0 && bind(fd, reinterpret_cast<sockaddr *>(&address), sizeof address) == 0)
+        return fd;
+    if (fd >= 0)
+        close(fd);
+    return -1;
 }
 
 // Whether `pid` runs, as a process that has not exited.
@@ -147,6 +166,8 @@ TEST(KorvsnmpcdProgram, DaemonKeepsNoneOfItsCallersDescriptors)
     }
     EXPECT_TRUE(Running(daemon));
     EXPECT_EQ(korvtest::ExchangeWith(socket, kReload), "{\"success\":true}");
+    CollectorProcess probe(KORVSNMPCD_PATH, {"--probe", "--socket", socket}, TestPath("probe.log"));
+    EXPECT_EQ(probe.WaitForExit(), 0);
 
     // Neither the caller nor the daemon holds the pipe's write end: it reads as ended at once.
     pollfd ended = {readEnd, POLLIN, 0};
@@ -172,6 +193,26 @@ TEST(KorvsnmpcdProgram, DaemonKeepsNoneOfItsCallersDescriptors)
         std::this_thread::sleep_for(std::chrono::milliseconds(10));
     EXPECT_FALSE(Running(daemon));
     EXPECT_NE(access(socket.c_str(), F_OK), 0);
+}
+
+TEST(KorvsnmpcdProgram, TellsTheServiceManagerOnceItListens)
+{
+    const std::string manager = TestPath("notify.sock");
+    const std::string socket = TestPath("notified.sock");
+    int listener = NotificationSocket(manager);
+    ASSERT_GE(listener, 0);
+    setenv("NOTIFY_SOCKET", manager.c_str(), 1);
+    CollectorProcess daemon(KORVSNMPCD_PATH, {"--socket", socket}, TestPath("notified.log"));
+    unsetenv("NOTIFY_SOCKET");
+    pollfd notified = {listener, POLLIN, 0};
+    ASSERT_EQ(poll(&notified, 1, 10000), 1) << daemon.Log();
+    char message[64] = {};
+    EXPECT_EQ(recv(listener, message, sizeof message - 1, 0), 7);
+    EXPECT_STREQ(message, "READY=1");
+    EXPECT_EQ(access(socket.c_str(), F_OK), 0) << "ready before it listens";
+    EXPECT_EQ(daemon.Stop(SIGTERM), 0);
+    close(listener);
+    unlink(manager.c_str());
 }
 
 TEST(KorvsnmpcdReplay, RecordedReplyIsServedAndFollowsItsFile)

@@ -19,6 +19,7 @@
 #include "reply_file.h"
 #include "sampler.h"
 #include "server.h"
+#include "service_notify.h"
 #include "unique_fd.h"
 
 namespace {
@@ -81,6 +82,16 @@ korvsnmpcd::UniqueFd Detach()
     return readyWrite;
 }
 
+// `path` from the current directory, which a daemon leaves for /.
+void MakeAbsolute(std::string &path)
+{
+    if (path.empty() || path[0] == '/')
+        return;
+    char here[PATH_MAX];
+    if (getcwd(here, sizeof here) != nullptr)
+        path = std::string(here) + "/" + path;
+}
+
 void SilenceStandardStreams()
 {
     korvsnmpcd::UniqueFd null(open("/dev/null", O_RDWR | O_CLOEXEC));
@@ -111,8 +122,12 @@ int main(int argc, char **argv)
     if (options.probe)
         return korvsnmpcd::SomethingListensOn(options.server.socketPath) ? EXIT_SUCCESS
                                                                          : EXIT_FAILURE;
-    if (options.detach)
+    if (options.detach) {
         CloseInheritedDescriptors();
+        for (std::string *path : {&options.server.socketPath, &options.server.recordPath,
+                                  &options.pidFile, &options.replayPath})
+            MakeAbsolute(*path);
+    }
 
     // A daemon's caller sees why it did not start; once detached, its stderr is /dev/null.
     bool toStderr = options.foreground || options.detach || isatty(STDERR_FILENO);
@@ -151,6 +166,7 @@ int main(int argc, char **argv)
             KORVSNMPCD_LOG(LOG_WARNING, "Cannot tell the caller that the daemon is ready: %m");
         ready.Reset();
     }
+    korvsnmpcd::NotifyReady();
     if (options.replayPath.empty())
         KORVSNMPCD_LOG(LOG_INFO, "Listening on [%s], sampling every %lld ms",
                        options.server.socketPath.c_str(),
