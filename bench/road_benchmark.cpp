@@ -38,6 +38,7 @@
 
 #include "korv_standin.h"
 #include "korvsnmp/korvsnmp.h"
+#include "protocol/collector_protocol.h"
 
 // ---- Allocation accounting, for the peak memory of one call ---------------
 
@@ -97,7 +98,7 @@ extern "C" void __syslog_chk(int priority, int, const char *format, ...)
 
 namespace {
 
-constexpr char kSocketPath[] = "/tmp/korvsnmpcd.sock";
+using korvproto::kCollectorSocketPath;
 constexpr int kInternalDisks = 24;
 constexpr int kExpansionUnits = 5;
 constexpr int kDisksPerUnit = 8;
@@ -248,19 +249,17 @@ class Collector {
 public:
     explicit Collector(const std::string &reply) : reply_(reply)
     {
-        unlink(kSocketPath);
+        unlink(kCollectorSocketPath);
         listenFd_ = socket(AF_UNIX, SOCK_STREAM, 0);
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, kSocketPath);
+        std::strcpy(address.sun_path, kCollectorSocketPath);
         if (bind(listenFd_, reinterpret_cast<sockaddr *>(&address), sizeof address) != 0 ||
             listen(listenFd_, 16) != 0) {
             std::perror("benchmark collector");
             std::exit(1);
         }
-        uint32_t length = htonl(static_cast<uint32_t>(reply_.size()));
-        frame_.assign(reinterpret_cast<char *>(&length), sizeof length);
-        frame_ += reply_;
+        frame_ = korvproto::EncodeFrame(reply_);
         server_ = std::thread([this] { Serve(); });
     }
     ~Collector()
@@ -269,7 +268,7 @@ public:
         close(Connect());  // wakes the accept
         server_.join();
         close(listenFd_);
-        unlink(kSocketPath);
+        unlink(kCollectorSocketPath);
     }
 
     static int Connect()
@@ -277,7 +276,7 @@ public:
         int fd = socket(AF_UNIX, SOCK_STREAM, 0);
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, kSocketPath);
+        std::strcpy(address.sun_path, kCollectorSocketPath);
         connect(fd, reinterpret_cast<sockaddr *>(&address), sizeof address);
         return fd;
     }
@@ -286,10 +285,10 @@ private:
     // Reads one whole request frame: its length, then that many bytes.
     static bool ReadRequest(int fd, std::vector<char> &buffer)
     {
-        uint32_t length = 0;
-        if (read(fd, &length, sizeof length) != static_cast<ssize_t>(sizeof length))
+        char prefix[korvproto::kFramePrefixBytes];
+        if (read(fd, prefix, sizeof prefix) != static_cast<ssize_t>(sizeof prefix))
             return false;
-        size_t missing = std::min<size_t>(ntohl(length), buffer.size());
+        size_t missing = std::min<size_t>(korvproto::DecodeFramePrefix(prefix), buffer.size());
         while (missing > 0) {
             ssize_t n = read(fd, buffer.data(), missing);
             if (n <= 0)
@@ -333,11 +332,7 @@ Json::Value Request()
 
 void Floor(benchmark::State &state)
 {
-    const std::string text = Json::FastWriter().write(Request());
-    std::string frame(4, '\0');
-    uint32_t length = htonl(static_cast<uint32_t>(text.size() + 1));
-    std::memcpy(frame.data(), &length, 4);
-    frame.append(text.c_str(), text.size() + 1);
+    const std::string frame = korvproto::EncodeRequestFrame(Request());
     std::vector<char> piece(65536);
     for (auto _ : state) {
         int fd = Collector::Connect();

@@ -20,7 +20,7 @@
 #include <korv_storage.h>
 
 #include "json_read.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

@@ -8,7 +8,7 @@
 #include "korvsnmp/fill_in_current_network.h"
 #include "korvsnmp/fill_in_current_space_io.h"
 #include "korvsnmp/parse_data.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

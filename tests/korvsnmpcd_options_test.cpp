@@ -18,8 +18,10 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <json/value.h>
 
 #include "collector_process.h"
+#include "protocol/collector_protocol.h"
 #include "command_line.h"
 
 namespace {
@@ -30,15 +32,14 @@ using ::testing::IsEmpty;
 using Clock = std::chrono::steady_clock;
 
 constexpr int kUsageError = 2;
-constexpr char kStatisticsFrame[] = "\0\0\0\x16{\"resource\":[\"all\"]}\n";  // with its NUL
-constexpr char kReloadFrame[] = "\0\0\0\x16{\"request\":\"reload\"}\n";
-
-std::string Frame(const char *bytes, size_t size)
+std::string RequestFrame(const char *member, const char *value)
 {
-    return std::string(bytes, size);
+    Json::Value request;
+    request[member] = value;
+    return korvproto::EncodeRequestFrame(request);
 }
-const std::string kStatistics = Frame(kStatisticsFrame, sizeof kStatisticsFrame);
-const std::string kReload = Frame(kReloadFrame, sizeof kReloadFrame);
+const std::string kStatistics = RequestFrame("resource", "all");
+const std::string kReload = RequestFrame("request", "reload");
 
 std::string TestPath(const char *tag)
 {

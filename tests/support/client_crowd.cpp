@@ -1,6 +1,5 @@
 #include "client_crowd.h"
 
-#include <arpa/inet.h>
 #include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
@@ -16,12 +15,15 @@
 #include <random>
 #include <sstream>
 
+#include <json/value.h>
+
+#include "protocol/collector_protocol.h"
+
 namespace korvtest {
 namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr char kStatisticsRequest[] = "{\"resource\":[\"all\"]}\n";
 constexpr size_t kMaxGarbageChunk = 16;
 constexpr int kPollSliceMs = 10;
 
@@ -51,9 +53,9 @@ int ConnectNow(const sockaddr_un &address)
 
 std::string RequestFrame()
 {
-    std::string body = std::string(kStatisticsRequest) + '\0';
-    uint32_t length = htonl(static_cast<uint32_t>(body.size()));
-    return std::string(reinterpret_cast<const char *>(&length), sizeof length) + body;
+    Json::Value request;
+    request["resource"].append("all");
+    return korvproto::EncodeRequestFrame(request);
 }
 
 }  // namespace
@@ -202,12 +204,11 @@ std::chrono::microseconds TimedProbe(const std::string &socketPath,
     }
     close(fd);
     auto took = std::chrono::duration_cast<microseconds>(Clock::now() - start);
-    uint32_t length = 0;
-    if (!closed || reply.size() < sizeof length)
+    const size_t prefix = korvproto::kFramePrefixBytes;
+    if (!closed || reply.size() < prefix)
         return failed;
-    std::memcpy(&length, reply.data(), sizeof length);
-    bool whole = ntohl(length) == reply.size() - sizeof length &&
-                 reply.compare(sizeof length, 8, "{\"data\":") == 0;
+    bool whole = korvproto::DecodeFramePrefix(reply.data()) == reply.size() - prefix &&
+                 reply.compare(prefix, 8, "{\"data\":") == 0;
     return whole ? took : failed;
 }
 

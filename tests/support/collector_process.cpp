@@ -1,6 +1,5 @@
 #include "collector_process.h"
 
-#include <arpa/inet.h>
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
@@ -15,6 +14,9 @@
 #include <sstream>
 #include <thread>
 
+#include "protocol/collector_protocol.h"
+#include "protocol/unique_fd.h"
+
 extern char **environ;
 
 namespace korvtest {
@@ -23,18 +25,16 @@ namespace {
 using Clock = std::chrono::steady_clock;
 constexpr auto kRetry = std::chrono::milliseconds(10);
 
-int ConnectTo(const std::string &path)
+korvproto::UniqueFd ConnectTo(const std::string &path)
 {
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    korvproto::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     sockaddr_un address;
     std::memset(&address, 0, sizeof address);
     address.sun_family = AF_UNIX;
     std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
-    if (fd >= 0 && connect(fd, reinterpret_cast<sockaddr *>(&address), sizeof address) == 0)
+    if (fd.Valid() && connect(fd.Get(), reinterpret_cast<sockaddr *>(&address), sizeof address) == 0)
         return fd;
-    if (fd >= 0)
-        close(fd);
-    return -1;
+    return korvproto::UniqueFd();
 }
 
 }  // namespace
@@ -102,11 +102,8 @@ bool WaitUntilConnectable(const std::string &path)
 {
     Clock::time_point giveUp = Clock::now() + kProcessWait;
     while (Clock::now() < giveUp) {
-        int fd = ConnectTo(path);
-        if (fd >= 0) {
-            close(fd);
+        if (ConnectTo(path).Valid())
             return true;
-        }
         std::this_thread::sleep_for(kRetry);
     }
     return false;
@@ -114,9 +111,10 @@ bool WaitUntilConnectable(const std::string &path)
 
 std::string ExchangeWith(const std::string &path, const std::string &frame)
 {
-    int fd = ConnectTo(path);
-    if (fd < 0)
+    korvproto::UniqueFd connection = ConnectTo(path);
+    if (!connection.Valid())
         return "";
+    const int fd = connection.Get();
     std::string reply;
     bool closed = false;
     if (send(fd, frame.data(), frame.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(frame.size())) {
@@ -132,12 +130,11 @@ std::string ExchangeWith(const std::string &path, const std::string &frame)
                 reply.append(buffer, static_cast<size_t>(got));
         }
     }
-    close(fd);
-    uint32_t length = 0;
-    if (!closed || reply.size() < sizeof length)
+    const size_t prefix = korvproto::kFramePrefixBytes;
+    if (!closed || reply.size() < prefix ||
+        korvproto::DecodeFramePrefix(reply.data()) != reply.size() - prefix)
         return "";
-    std::memcpy(&length, reply.data(), sizeof length);
-    return ntohl(length) == reply.size() - sizeof length ? reply.substr(sizeof length) : "";
+    return reply.substr(prefix);
 }
 
 std::string ReadWholeFile(const std::string &path)

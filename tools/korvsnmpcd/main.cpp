@@ -13,14 +13,14 @@
 #include <string>
 #include <vector>
 
-#include "collector_log.h"
+#include "protocol/unit_log.h"
 #include "command_line.h"
 #include "pid_file.h"
 #include "reply_file.h"
 #include "sampler.h"
 #include "server.h"
 #include "service_notify.h"
-#include "unique_fd.h"
+#include "protocol/unique_fd.h"
 
 namespace {
 
@@ -52,19 +52,19 @@ void CloseInheritedDescriptors()
 // Leaves the caller's session. Only the child returns, with the write end
 // of a pipe: the caller returns when the child writes to it (exit status 0,
 // the daemon is ready) or closes it without writing (exit status 1).
-korvsnmpcd::UniqueFd Detach()
+korvproto::UniqueFd Detach()
 {
     int ends[2];
     if (pipe2(ends, O_CLOEXEC) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot detach: %m");
-        return korvsnmpcd::UniqueFd();
+        KORVSNMP_LOG(LOG_ERR, "Cannot detach: %m");
+        return korvproto::UniqueFd();
     }
-    korvsnmpcd::UniqueFd readyRead(ends[0]);
-    korvsnmpcd::UniqueFd readyWrite(ends[1]);
+    korvproto::UniqueFd readyRead(ends[0]);
+    korvproto::UniqueFd readyWrite(ends[1]);
     pid_t child = fork();
     if (child < 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot detach: %m");
-        return korvsnmpcd::UniqueFd();
+        KORVSNMP_LOG(LOG_ERR, "Cannot detach: %m");
+        return korvproto::UniqueFd();
     }
     if (child > 0) {
         // Without running destructors, which would remove the socket file it shares with the child.
@@ -78,7 +78,7 @@ korvsnmpcd::UniqueFd Detach()
     }
     setsid();
     if (chdir("/") != 0)
-        KORVSNMPCD_LOG(LOG_WARNING, "Cannot change to /: %m");
+        KORVSNMP_LOG(LOG_WARNING, "Cannot change to /: %m");
     return readyWrite;
 }
 
@@ -94,7 +94,7 @@ void MakeAbsolute(std::string &path)
 
 void SilenceStandardStreams()
 {
-    korvsnmpcd::UniqueFd null(open("/dev/null", O_RDWR | O_CLOEXEC));
+    korvproto::UniqueFd null(open("/dev/null", O_RDWR | O_CLOEXEC));
     for (int stream : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
         if (null.Valid())
             dup2(null.Get(), stream);
@@ -137,7 +137,7 @@ int main(int argc, char **argv)
     // The daemon detaches first: the signal descriptor and the poller must
     // belong to the process that waits on them. The caller still returns
     // only when the daemon is ready, with status 1 when it is not.
-    korvsnmpcd::UniqueFd ready;
+    korvproto::UniqueFd ready;
     if (options.detach) {
         ready = Detach();
         if (!ready.Valid())
@@ -163,16 +163,16 @@ int main(int argc, char **argv)
     if (options.detach) {
         SilenceStandardStreams();
         if (write(ready.Get(), "", 1) != 1)
-            KORVSNMPCD_LOG(LOG_WARNING, "Cannot tell the caller that the daemon is ready: %m");
+            KORVSNMP_LOG(LOG_WARNING, "Cannot tell the caller that the daemon is ready: %m");
         ready.Reset();
     }
     korvsnmpcd::NotifyReady();
     if (options.replayPath.empty())
-        KORVSNMPCD_LOG(LOG_INFO, "Listening on [%s], sampling every %lld ms",
+        KORVSNMP_LOG(LOG_INFO, "Listening on [%s], sampling every %lld ms",
                        options.server.socketPath.c_str(),
                        static_cast<long long>(options.server.interval.count()));
     else
-        KORVSNMPCD_LOG(LOG_INFO, "Listening on [%s], replaying [%s]",
+        KORVSNMP_LOG(LOG_INFO, "Listening on [%s], replaying [%s]",
                        options.server.socketPath.c_str(), options.replayPath.c_str());
     bool served = server.Run(*source);
     closelog();

@@ -6,7 +6,7 @@
 #include <fstream>
 #include <sstream>
 
-#include "collector_log.h"
+#include "protocol/unit_log.h"
 
 namespace korvsnmpcd {
 namespace {
@@ -23,7 +23,7 @@ bool PidFile::Create(const std::string &path)
     out << content;
     out.close();
     if (!out || rename(partial.c_str(), path.c_str()) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot write the process id file [%s]: %m", path.c_str());
+        KORVSNMP_LOG(LOG_ERR, "Cannot write the process id file [%s]: %m", path.c_str());
         unlink(partial.c_str());
         return false;
     }

@@ -10,7 +10,7 @@
 
 #include <json/json.h>
 
-#include "collector_log.h"
+#include "protocol/unit_log.h"
 
 namespace korvsnmpcd {
 namespace {
@@ -64,12 +64,12 @@ bool ReplayFile::Load()
     std::stringstream text;
     text << in.rdbuf();
     if (!present || !in) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot read the reply to replay from [%s]", path_.c_str());
+        KORVSNMP_LOG(LOG_ERR, "Cannot read the reply to replay from [%s]", path_.c_str());
         return false;
     }
     std::string compact;
     if (!CompactObject(text.str(), compact)) {
-        KORVSNMPCD_LOG(LOG_ERR, "[%s] holds no JSON object to replay", path_.c_str());
+        KORVSNMP_LOG(LOG_ERR, "[%s] holds no JSON object to replay", path_.c_str());
         return false;
     }
     reply_ = std::move(compact);
@@ -90,17 +90,17 @@ bool RecordReply(const std::string &path, const std::string &reply)
         out << reply << '\n';
         out.close();
         if (!out) {
-            KORVSNMPCD_LOG(LOG_ERR, "Cannot write the reply to record into [%s]", partial.c_str());
+            KORVSNMP_LOG(LOG_ERR, "Cannot write the reply to record into [%s]", partial.c_str());
             unlink(partial.c_str());
             return false;
         }
     }
     if (rename(partial.c_str(), path.c_str()) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot put the recorded reply in place as [%s]: %m", path.c_str());
+        KORVSNMP_LOG(LOG_ERR, "Cannot put the recorded reply in place as [%s]: %m", path.c_str());
         unlink(partial.c_str());
         return false;
     }
-    KORVSNMPCD_LOG(LOG_NOTICE, "Recorded the statistics reply in [%s]", path.c_str());
+    KORVSNMP_LOG(LOG_NOTICE, "Recorded the statistics reply in [%s]", path.c_str());
     return true;
 }
 

@@ -14,7 +14,7 @@
 #include <cstring>
 #include <vector>
 
-#include "collector_log.h"
+#include "protocol/unit_log.h"
 #include "reply.h"
 #include "reply_file.h"
 
@@ -106,17 +106,17 @@ bool Server::Listen()
     sigaddset(&stopSignals, SIGTERM);
     sigaddset(&stopSignals, SIGINT);
     if (sigprocmask(SIG_BLOCK, &stopSignals, nullptr) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot block the stop signals: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot block the stop signals: %m");
         return false;
     }
     signals_ = UniqueFd(signalfd(-1, &stopSignals, SFD_NONBLOCK | SFD_CLOEXEC));
     if (!signals_.Valid()) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot watch the stop signals: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot watch the stop signals: %m");
         return false;
     }
     poller_ = UniqueFd(epoll_create1(EPOLL_CLOEXEC));
     if (!poller_.Valid()) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot create the poller: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot create the poller: %m");
         return false;
     }
     return FitConnectionCap() && TakeSocketPath() && Watch(signals_.Get(), EPOLLIN, &signals_) &&
@@ -127,23 +127,23 @@ bool Server::FitConnectionCap()
 {
     rlimit limit;
     if (getrlimit(RLIMIT_NOFILE, &limit) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot read the descriptor limit: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot read the descriptor limit: %m");
         return false;
     }
     rlim_t wanted = static_cast<rlim_t>(options_.maxConnections) + kSpareDescriptors;
     if (limit.rlim_cur < wanted) {
         limit.rlim_cur = std::min(wanted, limit.rlim_max);
         if (setrlimit(RLIMIT_NOFILE, &limit) != 0 || getrlimit(RLIMIT_NOFILE, &limit) != 0)
-            KORVSNMPCD_LOG(LOG_WARNING, "Cannot raise the descriptor limit: %m");
+            KORVSNMP_LOG(LOG_WARNING, "Cannot raise the descriptor limit: %m");
     }
     if (limit.rlim_cur < wanted) {
         if (limit.rlim_cur <= kSpareDescriptors) {
-            KORVSNMPCD_LOG(LOG_ERR, "The descriptor limit %llu leaves no room for connections",
+            KORVSNMP_LOG(LOG_ERR, "The descriptor limit %llu leaves no room for connections",
                            static_cast<unsigned long long>(limit.rlim_cur));
             return false;
         }
         options_.maxConnections = static_cast<size_t>(limit.rlim_cur - kSpareDescriptors);
-        KORVSNMPCD_LOG(LOG_NOTICE, "Serving at most %zu connections at once (descriptor limit %llu)",
+        KORVSNMP_LOG(LOG_NOTICE, "Serving at most %zu connections at once (descriptor limit %llu)",
                        options_.maxConnections, static_cast<unsigned long long>(limit.rlim_cur));
     }
     return true;
@@ -155,7 +155,7 @@ bool Server::Watch(int fd, uint32_t events, void *tag)
     event.events = events;
     event.data.ptr = tag;
     if (epoll_ctl(poller_.Get(), EPOLL_CTL_ADD, fd, &event) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot watch descriptor %d: %m", fd);
+        KORVSNMP_LOG(LOG_ERR, "Cannot watch descriptor %d: %m", fd);
         return false;
     }
     return true;
@@ -166,42 +166,42 @@ bool Server::TakeSocketPath()
     const char *path = options_.socketPath.c_str();
     sockaddr_un address;
     if (!FillAddress(options_.socketPath, address)) {
-        KORVSNMPCD_LOG(LOG_ERR, "Socket path [%s] is empty or too long", path);
+        KORVSNMP_LOG(LOG_ERR, "Socket path [%s] is empty or too long", path);
         return false;
     }
 
     struct stat existing;
     if (lstat(path, &existing) == 0) {
         if (!S_ISSOCK(existing.st_mode)) {
-            KORVSNMPCD_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
+            KORVSNMP_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
             return false;
         }
         if (SomeoneAnswers(address)) {
-            KORVSNMPCD_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting",
+            KORVSNMP_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting",
                            path);
             return false;
         }
         if (errno != ECONNREFUSED) {
-            KORVSNMPCD_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
+            KORVSNMP_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
             return false;
         }
         if (unlink(path) != 0 && errno != ENOENT) {
-            KORVSNMPCD_LOG(LOG_ERR, "Cannot remove the stale socket file [%s]: %m", path);
+            KORVSNMP_LOG(LOG_ERR, "Cannot remove the stale socket file [%s]: %m", path);
             return false;
         }
-        KORVSNMPCD_LOG(LOG_NOTICE, "Replaced the stale socket file [%s]", path);
+        KORVSNMP_LOG(LOG_NOTICE, "Replaced the stale socket file [%s]", path);
     } else if (errno != ENOENT) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
+        KORVSNMP_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
         return false;
     }
 
     listening_ = UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
     if (!listening_.Valid()) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot create the listening socket: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot create the listening socket: %m");
         return false;
     }
     if (bind(listening_.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot bind [%s]: %m", path);
+        KORVSNMP_LOG(LOG_ERR, "Cannot bind [%s]: %m", path);
         return false;
     }
     struct stat made;
@@ -211,9 +211,9 @@ bool Server::TakeSocketPath()
         ownsSocketFile_ = true;
     }
     if (chmod(path, kSocketMode) != 0)
-        KORVSNMPCD_LOG(LOG_WARNING, "Cannot open [%s] to every local user: %m", path);
+        KORVSNMP_LOG(LOG_WARNING, "Cannot open [%s] to every local user: %m", path);
     if (listen(listening_.Get(), kListenBacklog) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot listen on [%s]: %m", path);
+        KORVSNMP_LOG(LOG_ERR, "Cannot listen on [%s]: %m", path);
         return false;
     }
     return true;
@@ -241,7 +241,7 @@ bool Server::Run(StatisticsSource &source)
             wakeUp = std::min(wakeUp, connections_.front().deadline);
         int ready = epoll_wait(poller_.Get(), events, kEventBatch, MillisecondsUntil(wakeUp, now));
         if (ready < 0 && errno != EINTR) {
-            KORVSNMPCD_LOG(LOG_ERR, "epoll_wait() failed: %m");
+            KORVSNMP_LOG(LOG_ERR, "epoll_wait() failed: %m");
             return false;
         }
 
@@ -252,7 +252,7 @@ bool Server::Run(StatisticsSource &source)
             if (tag == &signals_) {
                 signalfd_siginfo info;
                 if (read(signals_.Get(), &info, sizeof info) == static_cast<ssize_t>(sizeof info)) {
-                    KORVSNMPCD_LOG(LOG_NOTICE, "Stopping on signal %u", info.ssi_signo);
+                    KORVSNMP_LOG(LOG_NOTICE, "Stopping on signal %u", info.ssi_signo);
                     return true;
                 }
             } else if (tag == &listening_) {
@@ -339,25 +339,25 @@ void Server::Report(Event event, uint64_t n)
     auto count = static_cast<unsigned long long>(n);
     switch (event) {
     case Event::kRefusedFrame:
-        KORVSNMPCD_LOG(LOG_WARNING, "Refused %llu request frame(s) whose length is 0 or beyond %u",
-                       count, kMaxRequestBytes);
+        KORVSNMP_LOG(LOG_WARNING, "Refused %llu request frame(s) whose length is 0 or beyond %u",
+                       count, korvproto::kMaxRequestBytes);
         break;
     case Event::kRefusedBody:
-        KORVSNMPCD_LOG(LOG_WARNING, "Refused %llu request(s) that are not a JSON object", count);
+        KORVSNMP_LOG(LOG_WARNING, "Refused %llu request(s) that are not a JSON object", count);
         break;
     case Event::kTimedOut:
-        KORVSNMPCD_LOG(LOG_NOTICE,
+        KORVSNMP_LOG(LOG_NOTICE,
                        "Closed %llu connection(s) that did not finish their exchange within "
                        "%lld ms",
                        count, static_cast<long long>(options_.clientTimeout.count()));
         break;
     case Event::kEvicted:
-        KORVSNMPCD_LOG(LOG_WARNING,
+        KORVSNMP_LOG(LOG_WARNING,
                        "Closed %llu unfinished connection(s) to stay within %zu connections",
                        count, options_.maxConnections);
         break;
     case Event::kAcceptFailed:
-        KORVSNMPCD_LOG(LOG_ERR, "accept() failed %llu time(s), last: %s", count,
+        KORVSNMP_LOG(LOG_ERR, "accept() failed %llu time(s), last: %s", count,
                        strerror(lastAcceptError_));
         break;
     }
@@ -392,14 +392,14 @@ void Server::Answer(Connection &connection, StatisticsSource &source)
     if (kind != RequestKind::kStatistics) {
         if (kind == RequestKind::kNotAnObject)
             Note(Event::kRefusedBody, Clock::now());
-        connection.reply = FrameReply(ControlReply(kind));
+        connection.reply = korvproto::EncodeFrame(ControlReply(kind));
     } else {
         const std::string &statistics = source.Reply();
         if (!options_.recordPath.empty()) {
             RecordReply(options_.recordPath, statistics);
             options_.recordPath.clear();  // only the next reply, kept or not
         }
-        connection.reply = FrameReply(statistics);
+        connection.reply = korvproto::EncodeFrame(statistics);
     }
     Send(connection);
     if (!connection.done) {

@@ -22,13 +22,16 @@
 #include <vector>
 
 #include "event_throttle.h"
-#include "framing.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unique_fd.h"
 #include "statistics_source.h"
-#include "unique_fd.h"
 
 namespace korvsnmpcd {
 
-constexpr char kDefaultSocketPath[] = "/tmp/korvsnmpcd.sock";
+using korvproto::RequestDecoder;
+using korvproto::UniqueFd;
+
+inline constexpr const char *kDefaultSocketPath = korvproto::kCollectorSocketPath;
 constexpr size_t kDefaultMaxConnections = 4096;
 // Every local process may ask for statistics: the appliance's agents run
 // under users of their own.

@@ -8,11 +8,13 @@
 #include <cstring>
 #include <string>
 
-#include "collector_log.h"
-#include "unique_fd.h"
+#include "protocol/unit_log.h"
+#include "protocol/unique_fd.h"
 
 namespace korvsnmpcd {
 namespace {
+
+using korvproto::UniqueFd;
 
 constexpr char kLogUnit[] = "service_notify";
 constexpr char kVariable[] = "NOTIFY_SOCKET";
@@ -33,7 +35,7 @@ void NotifyReady()
     address.sun_family = AF_UNIX;
     if (target.empty() || (target[0] != '/' && target[0] != '@') ||
         target.size() >= sizeof address.sun_path) {
-        KORVSNMPCD_LOG(LOG_WARNING, "Cannot use %s [%s]", kVariable, target.c_str());
+        KORVSNMP_LOG(LOG_WARNING, "Cannot use %s [%s]", kVariable, target.c_str());
         return;
     }
     std::memcpy(address.sun_path, target.data(), target.size());
@@ -44,7 +46,7 @@ void NotifyReady()
     UniqueFd fd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
     if (!fd.Valid() || sendto(fd.Get(), kReady, sizeof kReady - 1, MSG_NOSIGNAL,
                               reinterpret_cast<const sockaddr *>(&address), length) < 0)
-        KORVSNMPCD_LOG(LOG_WARNING, "Cannot tell the service manager [%s] that it is ready: %m",
+        KORVSNMP_LOG(LOG_WARNING, "Cannot tell the service manager [%s] that it is ready: %m",
                        target.c_str());
 }
 
