@@ -145,8 +145,11 @@ TEST_F(KorvsnmpcdCrowd, SilentAndSlowClientsAreClosedAtTheirDeadline)
 {
     // One byte every 100 ms never finishes a request within 200 ms: each byte must not buy time.
     Start({"--client-timeout", "0.2"});
+    Clock::time_point start = Clock::now();
     ClientCrowd stalling(path_, CrowdSize{100, 20, 0}, /*reconnect=*/false);
+    EXPECT_GT(korvtest::TimedProbe(path_, kProbeLimit).count(), 0) << "held up by the stalled ones";
     EXPECT_TRUE(Eventually([&] { return stalling.ClosedByPeer() == 120; })) << stalling.ClosedByPeer();
+    EXPECT_GE(Clock::now() - start, milliseconds(200)) << "closed before their deadline";
     EXPECT_TRUE(BackToBaseline());
     EXPECT_THAT(daemon_->Log(),
                 HasSubstr("Closed 1 connection(s) that did not finish their exchange within 200 ms"));

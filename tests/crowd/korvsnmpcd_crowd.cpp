@@ -8,6 +8,7 @@
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <fstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -22,10 +23,21 @@ constexpr auto kSettle = seconds(2);           // the crowd connects and starts 
 constexpr auto kProbeGap = milliseconds(20);   // between two probes
 constexpr auto kDrainWait = seconds(30);       // for the descriptors to return after the crowd
 
+size_t ResidentKiB(pid_t pid)
+{
+    std::ifstream status("/proc/" + std::to_string(pid) + "/status");
+    std::string line;
+    while (std::getline(status, line)) {
+        if (line.compare(0, 6, "VmRSS:") == 0)
+            return std::stoul(line.substr(6));
+    }
+    return 0;
+}
+
 void Report(const char *when, pid_t pid)
 {
     std::printf("%-16s descriptors %zu, resident %zu KiB\n", when,
-                korvtest::OpenDescriptorCount(pid), korvtest::ResidentKiB(pid));
+                korvtest::OpenDescriptorCount(pid), ResidentKiB(pid));
 }
 
 }  // namespace

@@ -11,7 +11,6 @@
 #include <cerrno>
 #include <cmath>
 #include <cstring>
-#include <fstream>
 #include <random>
 #include <sstream>
 
@@ -233,17 +232,6 @@ size_t OpenDescriptorCount(pid_t pid)
         closedir(entries);
     }
     return count;
-}
-
-size_t ResidentKiB(pid_t pid)
-{
-    std::ifstream status("/proc/" + std::to_string(pid) + "/status");
-    std::string line;
-    while (std::getline(status, line)) {
-        if (line.compare(0, 6, "VmRSS:") == 0)
-            return std::stoul(line.substr(6));
-    }
-    return 0;
 }
 
 }  // namespace korvtest

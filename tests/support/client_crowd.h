@@ -65,9 +65,8 @@ std::chrono::microseconds TimedProbe(const std::string &socketPath,
 // The p-th percentile (0-100) of `samples`, nearest rank; 0 when empty.
 std::chrono::microseconds Percentile(std::vector<std::chrono::microseconds> samples, double p);
 
-// Open descriptors and resident memory (KiB) of process `pid`, from /proc.
+// Open descriptors of process `pid`, from /proc.
 size_t OpenDescriptorCount(pid_t pid);
-size_t ResidentKiB(pid_t pid);
 
 }  // namespace korvtest
 
