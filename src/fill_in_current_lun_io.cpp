@@ -26,18 +26,18 @@ constexpr char kLunNameKey[] = "lun_name";
 // LUN UUID -> LUN name.
 using LunNameMap = std::map<std::string, std::string>;
 
-// Every record must be an object (or null) whose "device", when present, is
-// a string; otherwise nothing of `lunIO` may be rewritten.
+// Every record must follow the record rule; otherwise nothing of `lunIO` may
+// be rewritten.
 bool RecordsAreReadable(const Json::Value &lunIO)
 {
     for (Json::ArrayIndex index = 0; index < lunIO.size(); ++index) {
         const Json::Value &record = lunIO[index];
-        if (!korvsnmp::IsRecord(record)) {
+        if (!korvread::IsRecord(record)) {
             KORVSNMP_LOG(LOG_ERR, "LunIO element %u is not an object", index);
             return false;
         }
-        const Json::Value *device = record.find(kDeviceKey, kDeviceKey + sizeof kDeviceKey - 1);
-        if (device != nullptr && !device->isString()) {
+        std::string device;
+        if (!korvread::ReadDeviceName(record, device)) {
             KORVSNMP_LOG(LOG_ERR, "LunIO element %u: \"%s\" is not a string", index, kDeviceKey);
             return false;
         }

@@ -1,7 +1,7 @@
 // Assembly of the caller's statistics result from one collector reply.
 #include <json/value.h>
+#include <korv_webapi.h>
 
-#include "korv_webapi.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
 #include "korvsnmp/fill_in_current_lun_io.h"
 #include "korvsnmp/fill_in_current_memory.h"
