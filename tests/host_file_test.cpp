@@ -153,7 +153,7 @@ const BadFile kBadFiles[] = {
     {"UnknownContainer", R"({"disks": [{"number": 1, "container": "tray", "device_path": "/dev/sda"}]})",
      "disks[0].container: unknown container \"tray\" (internal, ebox or ssd_cache)"},
     {"PathLongerThanItsField",
-     R"({"disks": [{"number": 1, "container": "internal", "device_path": "/dev/)" + std::string(59, 'x') + "\"}]})",
+     R"({"disks": [{"number": 1, "container": "internal", "device_path": "/dev/)" + std::string(59, 'x') + "\"}]}",
      "disks[0].device_path: longer than 63 characters"},
     {"NameLongerThanItsField", R"({"interfaces": [{"name": "eth0123456789abc"}]})",
      "interfaces[0].name: longer than 15 characters"},
@@ -185,10 +185,11 @@ TEST_P(BadHostFile, EveryOperationFailsWithOneMessage)
     EXPECT_LT(KORV::APIRunner::Exec(response, "KORV.Core.ISCSI.LUN", 1, "list", Json::Value(), "admin"), 0);
     EXPECT_FALSE(response["success"].asBool());
 
-    ASSERT_EQ(korvtest::LoggedMessages().size(), 1u);
+    const std::vector<korvtest::LogEntry> logged = korvtest::LoggedMessages();
+    ASSERT_EQ(logged.size(), 1u);
     const std::string expected = "Host description " + path_ + ": " + GetParam().error;
-    const std::string &message = korvtest::LoggedMessages()[0].text;
-    EXPECT_EQ(korvtest::LoggedMessages()[0].priority, LOG_ERR);
+    const std::string &message = logged[0].text;
+    EXPECT_EQ(logged[0].priority, LOG_ERR);
     EXPECT_THAT(message, ::testing::StartsWith("korvplatform:"));
     EXPECT_THAT(message, ::testing::HasSubstr(expected)) << message;
     EXPECT_THAT(message, ::testing::EndsWith("; every platform operation fails"));
