@@ -120,8 +120,8 @@ bool SendControlRequest(const Json::Value &request)
     }
     if (IsSuccessReply(reply))
         return true;
-    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]", korvproto::CompactJson(request).c_str(),
-                 korvproto::CompactJson(reply).c_str());
+    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]",
+                 korvproto::CompactJson(request).c_str(), korvproto::CompactJson(reply).c_str());
     return false;
 }
 
