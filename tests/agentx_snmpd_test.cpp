@@ -364,7 +364,7 @@ protected:
     // The library's result for `reply`, as this host's platform names it.
     static Json::Value LibraryResult(const Json::Value &reply)
     {
-        korvstandin::UseLiveHost();
+        korvstandin::UseProcessHost();
         Json::Value request, result;
         request["resource"].append("all");
         EXPECT_TRUE(SNMPParseReplyData(request, reply, result));
@@ -470,6 +470,19 @@ TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCounte
     };
     EXPECT_EQ(count("No statistics from the collector; answering from the last sample"), 1u) << log;
     EXPECT_EQ(count("The collector answers again"), 1u) << log;
+}
+
+TEST_F(AgentxUnderSnmpd, SigtermDuringAStalledExchangeStopsAtOnce)
+{
+    collector_->Script({"", false});  // the first sample stalls
+    const int idle = CollectorSocketCount();
+    StartSubagent();
+    ASSERT_TRUE(PollUntil([&] { return CollectorSocketCount() > idle; }));
+    ASSERT_TRUE(PollUntil([&] { return Get("korvSampleInterval.0") == "korvSampleInterval.0 = 3600\n"; }));
+
+    const auto start = Clock::now();
+    EXPECT_EQ(subagent_->Stop(), 0) << ReadFile(SubagentLog());
+    EXPECT_LT(Clock::now() - start, std::chrono::seconds(10));  // not the library's 90 s
 }
 
 TEST_F(AgentxUnderSnmpd, ARestartedSnmpdFindsTheSubagentRegisteredAgain)
