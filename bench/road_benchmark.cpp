@@ -36,6 +36,7 @@
 #include <json/reader.h>
 #include <json/writer.h>
 
+#include "appliance.h"
 #include "korv_standin.h"
 #include "korvsnmp/korvsnmp.h"
 #include "protocol/collector_protocol.h"
@@ -99,24 +100,7 @@ extern "C" void __syslog_chk(int priority, int, const char *format, ...)
 namespace {
 
 using korvproto::kCollectorSocketPath;
-constexpr int kInternalDisks = 24;
-constexpr int kExpansionUnits = 5;
-constexpr int kDisksPerUnit = 8;
-constexpr int kUsbDevices = 2;
-constexpr int kEsataDevices = 6;
-constexpr int kPlainInterfaces = 24;
-constexpr int kVlans = 6;
-constexpr int kSpaces = 64;
-constexpr int kFlashCaches = 16;
-constexpr int kLuns = 512;
-
-std::string DiskName(int index)
-{
-    std::string name = "sd";
-    if (index >= 26)
-        name += static_cast<char>('a' + index / 26 - 1);
-    return name + static_cast<char>('a' + index % 26);
-}
+constexpr int kSpaces = 64;  // as many nodes as the large appliance has spaces
 
 // Real block-device nodes for the spaces: the library resolves each through
 // /sys/dev/block, as on the appliance.
@@ -147,101 +131,16 @@ struct SpaceNodes {
     ~SpaceNodes() { std::filesystem::remove_all(directory); }
 };
 
-Json::Value Counters(Json::Value record, unsigned seed)
-{
-    record["utilization"] = seed % 100;
-    record["read_access"] = seed * 3;
-    record["read_byte"] = seed * 4096;
-    record["write_access"] = seed * 5;
-    record["write_byte"] = seed * 8192;
-    return record;
-}
-
-Json::Value Device(const std::string &name)
-{
-    Json::Value record(Json::objectValue);
-    record["device"] = name;
-    return record;
-}
-
 // Describes the appliance to the stand-in, and returns the collector's reply.
 std::string DescribeAppliance(const SpaceNodes &nodes)
 {
-    using namespace korvstandin;
-    Reset();
-    HostDescription &host = Host();
-    host.physMemSize = 16777216;
-    host.supportsEBox = true;
-    host.files[kStringsFilePath]["volume"] = {{"volume_disk", "Disk"},
-                                              {"volume_expansion", "Expansion Unit"},
-                                              {"dedicated_ssd_cache", "SSD Cache"}};
-    Json::Value data(Json::objectValue);
-    Json::Value &disks = data["DiskIO"] = Json::Value(Json::arrayValue);
-    int index = 0;
-    for (; index < kInternalDisks; ++index)
-        host.disks.push_back({index + 1, DISK_CONTAINER_INTERNAL, 0, "/dev/" + DiskName(index)});
-    for (int unit = 0; unit < kExpansionUnits; ++unit) {
-        ExpansionUnit expansion{static_cast<unsigned>(unit + 1), {}, std::string("Korvel-X5"), true};
-        for (int slot = 0; slot < kDisksPerUnit; ++slot, ++index) {
-            host.disks.push_back({slot + 1, DISK_CONTAINER_EBOX, 0, "/dev/" + DiskName(index)});
-            expansion.diskPaths.push_back("/dev/" + DiskName(index));
-        }
-        host.expansionUnits.push_back(expansion);
-    }
-    for (int i = 0; i < kUsbDevices; ++i, ++index)
-        host.usb.devices.push_back({DiskName(index), "USB Disk " + std::to_string(i + 1)});
-    for (int i = 0; i < kEsataDevices; ++i, ++index)
-        host.esata.devices.push_back({DiskName(index), "eSATA Disk " + std::to_string(i + 1)});
-    for (int i = 0; i < index; ++i)
-        disks.append(Counters(Device(DiskName(i)), i + 1));
-
-    Json::Value &network = data["Network"] = Json::Value(Json::arrayValue);
-    for (int i = 0; i < kPlainInterfaces; ++i)
-        host.interfaces.push_back({"eth" + std::to_string(i)});
-    for (int i = 0; i < kVlans; ++i)
-        host.interfaces.push_back({"eth0." + std::to_string(i + 10), NetRole::Vlan, "eth0",
-                                   "eth0." + std::to_string(i + 10)});
-    host.interfaces.push_back({"bond0", NetRole::Aggregation, "", "", {"eth20", "eth21"}});
-    host.interfaces.push_back({"bond1", NetRole::Aggregation, "", "", {"eth22", "eth23"}});
-    for (const NetInterface &entry : host.interfaces) {
-        Json::Value record = Device(entry.name);
-        record["rx"] = 123456u;
-        record["tx"] = 654321u;
-        network.append(record);
-    }
-
-    Json::Value &spaces = data["SpaceIO"] = Json::Value(Json::arrayValue);
-    for (size_t i = 0; i < nodes.paths.size(); ++i) {
-        host.spaces.push_back({nodes.paths[i], "volume" + std::to_string(i + 1)});
-        if (static_cast<int>(i) < kFlashCaches)
-            host.flashCaches.push_back(
-                {nodes.paths[i], "/volume" + std::to_string(i + 1), nodes.paths[(i + 1) % nodes.paths.size()]});
-        spaces.append(Counters(Device(nodes.kernelNames[i]), static_cast<unsigned>(i + 7)));
-    }
-    spaces.append(Counters(Device("total"), 99));
-
-    Json::Value &luns = data["iSCSI"] = Json::Value(Json::arrayValue);
-    for (int i = 0; i < kLuns; ++i) {
-        std::string uuid = "6001405f-0000-4000-8000-" + std::to_string(100000000000 + i);
-        host.luns.push_back({Json::Value(uuid), Json::Value("LUN-" + std::to_string(i + 1))});
-        luns.append(Counters(Device(uuid), i + 3));
-    }
-
-    Json::Value cpu(Json::objectValue);
-    cpu["user"] = 12;
-    cpu["system"] = 5;
-    cpu["idle"] = 83;
-    data["System"].append(cpu);
-    Json::Value memory(Json::objectValue);
-    memory["total_real"] = 16777216;
-    memory["avail_real"] = 9000000;
-    data["Memory"].append(memory);
-    data["NFS"]["read"] = 10;
-    data["NFS"]["write"] = 20;
-    data["time"] = 1795000000;
-    Json::Value reply(Json::objectValue);
-    reply["data"] = data;
-    return Json::FastWriter().write(reply);
+    std::vector<korvexample::SpaceDevice> devices;
+    for (size_t i = 0; i < nodes.paths.size(); ++i)
+        devices.push_back({nodes.paths[i], nodes.kernelNames[i]});
+    korvexample::Appliance appliance = korvexample::MakeAppliance(korvexample::LargeAppliance(), devices);
+    korvstandin::Reset();
+    korvstandin::Host() = std::move(appliance.host);
+    return Json::FastWriter().write(appliance.reply);
 }
 
 // Serves the framed reply to every connection, on its own thread.

@@ -364,7 +364,7 @@ protected:
     // The library's result for `reply`, as this host's platform names it.
     static Json::Value LibraryResult(const Json::Value &reply)
     {
-        korvstandin::UseLiveHost();
+        korvstandin::UseProcessHost();
         Json::Value request, result;
         request["resource"].append("all");
         EXPECT_TRUE(SNMPParseReplyData(request, reply, result));

@@ -1,15 +1,12 @@
 // The reference collector: its parsers on fixed kernel texts, the rate
 // rules, the replies, and the built daemon itself, run on a socket of its own
 // and talked to over raw connections, hostile clients included.
-#include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
-#include <spawn.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -17,7 +14,7 @@
 #include <chrono>
 #include <cstring>
 #include <fstream>
-#include <sstream>
+#include <memory>
 #include <string>
 #include <thread>
 #include <vector>
@@ -26,6 +23,8 @@
 #include <gtest/gtest.h>
 #include <json/json.h>
 
+#include "client_crowd.h"
+#include "collector_process.h"
 #include "proc_parsers.h"
 #include "protocol/collector_protocol.h"
 #include "protocol/unique_fd.h"
@@ -34,11 +33,10 @@
 #include "json_text.h"
 #include "syslog_capture.h"
 
-extern char **environ;
-
 namespace {
 
 using korvsnmpcd::BlockCounters;
+using korvtest::CollectorProcess;
 using korvsnmpcd::Snapshot;
 using korvproto::UniqueFd;
 using korvtest::Logged;
@@ -295,24 +293,23 @@ TEST(KorvsnmpcdReply, StatisticsSections)
 class KorvsnmpcdAnswer : public ::testing::Test {
 protected:
     void SetUp() override { korvtest::ClearLog(); }
-    const std::string statistics_ = "{\"data\":{}}";
 };
 
 TEST_F(KorvsnmpcdAnswer, ControlAndStatisticsRequests)
 {
-    const std::string success = "{\"success\":true}";
-    EXPECT_EQ(korvsnmpcd::AnswerRequest(std::string("{\"request\":\"reload\"}\n\0", 22), statistics_),
-              success);
-    EXPECT_EQ(korvsnmpcd::AnswerRequest("{\"reason\":\"disk swap\",\"request\":\"history_mode\"}\n",
-                                        statistics_),
-              success);
+    using korvsnmpcd::RequestKind;
+    EXPECT_EQ(korvsnmpcd::ReadRequest(std::string("{\"request\":\"reload\"}\n\0", 22)),
+              RequestKind::kControl);
+    EXPECT_EQ(korvsnmpcd::ReadRequest("{\"reason\":\"disk swap\",\"request\":\"history_mode\"}\n"),
+              RequestKind::kControl);
+    EXPECT_EQ(korvsnmpcd::ControlReply(RequestKind::kControl), "{\"success\":true}");
     EXPECT_THAT(korvtest::LoggedMessages(),
                 ElementsAre(Logged(LOG_NOTICE, "reply",
                                    "Reload requested; nothing to reload, sampling goes on"),
                             Logged(LOG_NOTICE, "reply", "History mode requested, reason: [disk swap]")));
     for (const char *statisticsRequest :
          {"{\"resource\":[\"all\"]}\n", "{}", "{\"request\":\"other\"}", "{\"request\":7}"})
-        EXPECT_EQ(korvsnmpcd::AnswerRequest(statisticsRequest, statistics_), statistics_)
+        EXPECT_EQ(korvsnmpcd::ReadRequest(statisticsRequest), RequestKind::kStatistics)
             << statisticsRequest;
 }
 
@@ -321,22 +318,18 @@ TEST_F(KorvsnmpcdAnswer, AnythingButAnObjectIsRefused)
     const std::string deep(100000, '[');
     for (const std::string &body : {std::string("garbage"), std::string("[1,2]"), std::string("7"),
                                     std::string(""), std::string("{\"a\":"), deep}) {
-        korvtest::ClearLog();
-        EXPECT_EQ(korvsnmpcd::AnswerRequest(body, statistics_),
-                  "{\"error\":\"the request is not a JSON object\",\"success\":false}")
+        EXPECT_EQ(korvsnmpcd::ReadRequest(body), korvsnmpcd::RequestKind::kNotAnObject)
             << body.substr(0, 20);
-        EXPECT_THAT(korvtest::LoggedMessages(),
-                    ElementsAre(Logged(LOG_WARNING, "reply",
-                                       "Refused a request that is not a JSON object")));
     }
+    EXPECT_EQ(korvsnmpcd::ControlReply(korvsnmpcd::RequestKind::kNotAnObject),
+              "{\"error\":\"the request is not a JSON object\",\"success\":false}");
+    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());  // the server counts refusals
 }
 
 // ---------------------------------------------------------------- the daemon
 
-constexpr auto kStartWait = std::chrono::seconds(10);
 constexpr auto kPeerWait = std::chrono::seconds(5);
 constexpr char kClientTimeout[] = "0.6";
-constexpr auto kClientTimeoutMs = std::chrono::milliseconds(600);
 constexpr auto kPrompt = std::chrono::milliseconds(400);  // well within the client timeout
 
 std::string TestSocketPath(const char *tag)
@@ -395,127 +388,22 @@ Json::Value StatisticsRequest()
     return request;
 }
 
-// One exchange; the reply body, after checking that its prefix is its exact length.
-std::string Exchange(const std::string &path, const std::string &frame)
-{
-    UniqueFd fd = Connect(path);
-    EXPECT_TRUE(fd.Valid()) << "cannot connect to " << path;
-    if (!fd.Valid() || !SendAll(fd.Get(), frame))
-        return "";
-    bool closed = false;
-    std::string reply = ReadUntilClosed(fd.Get(), closed);
-    EXPECT_TRUE(closed) << "the daemon kept the connection open";
-    EXPECT_GE(reply.size(), 4u);
-    if (reply.size() < 4)
-        return "";
-    EXPECT_EQ(korvproto::DecodeFramePrefix(reply.data()), reply.size() - 4);
-    return reply.substr(4);
-}
-
 bool Answers(const std::string &path)
 {
     const std::string frame = korvproto::EncodeRequestFrame(StatisticsRequest());
-    Json::Value reply = korvtest::ParseJson(Exchange(path, frame));
+    Json::Value reply = korvtest::ParseJson(korvtest::ExchangeWith(path, frame));
     return reply.isObject() && reply["data"].isObject() && reply["data"]["Memory"].isArray();
 }
 
-std::string ReadFile(const std::string &path)
+// The built daemon on a socket path of its own; its output goes to a file beside the socket.
+std::unique_ptr<CollectorProcess> StartDaemon(const std::string &path)
 {
-    std::ifstream in(path);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
+    return std::make_unique<CollectorProcess>(
+        KORVSNMPCD_PATH,
+        std::vector<std::string>{"--foreground", "--socket", path, "--interval", "0.05",
+                                 "--client-timeout", kClientTimeout},
+        path + ".log");
 }
-
-size_t OpenDescriptors(pid_t pid)
-{
-    std::string dir = "/proc/" + std::to_string(pid) + "/fd";
-    size_t count = 0;
-    if (DIR *entries = opendir(dir.c_str())) {
-        while (readdir(entries) != nullptr)
-            ++count;
-        closedir(entries);
-    }
-    return count;
-}
-
-// The built daemon, run as a child on a socket path of its own; its
-// stderr goes to a file beside the socket.
-class Daemon {
-public:
-    explicit Daemon(const std::string &socketPath, const char *interval = "0.05")
-        : socketPath_(socketPath), logPath_(socketPath + ".log")
-    {
-        std::vector<std::string> args = {KORVSNMPCD_PATH, "--socket", socketPath_,
-                                         "--interval", interval, "--client-timeout",
-                                         kClientTimeout};
-        std::vector<char *> argv;
-        for (std::string &arg : args)
-            argv.push_back(arg.data());
-        argv.push_back(nullptr);
-        posix_spawn_file_actions_t actions;
-        posix_spawn_file_actions_init(&actions);
-        posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, logPath_.c_str(),
-                                         O_WRONLY | O_CREAT | O_TRUNC, 0600);
-        if (posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(), environ) != 0)
-            pid_ = -1;
-        posix_spawn_file_actions_destroy(&actions);
-    }
-    ~Daemon()
-    {
-        if (pid_ > 0)
-            Stop(SIGKILL);
-        unlink(logPath_.c_str());
-    }
-    Daemon(const Daemon &) = delete;
-    Daemon &operator=(const Daemon &) = delete;
-
-    pid_t Pid() const { return pid_; }
-    std::string Log() const { return ReadFile(logPath_); }
-
-    bool WaitUntilAnswering() const
-    {
-        Clock::time_point giveUp = Clock::now() + kStartWait;
-        while (Clock::now() < giveUp) {
-            if (Connect(socketPath_).Valid())
-                return true;
-            std::this_thread::sleep_for(std::chrono::milliseconds(10));
-        }
-        return false;
-    }
-
-    // The exit status, or -1 when it did not exit in time.
-    int WaitForExit()
-    {
-        Clock::time_point giveUp = Clock::now() + kStartWait;
-        while (pid_ > 0 && Clock::now() < giveUp) {
-            int status = 0;
-            if (waitpid(pid_, &status, WNOHANG) == pid_) {
-                pid_ = -1;
-                return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-            }
-            std::this_thread::sleep_for(std::chrono::milliseconds(10));
-        }
-        return -1;
-    }
-
-    int Stop(int signal = SIGTERM)
-    {
-        kill(pid_, signal);
-        int status = WaitForExit();
-        if (status < 0) {
-            kill(pid_, SIGKILL);
-            waitpid(pid_, nullptr, 0);
-            pid_ = -1;
-        }
-        return status;
-    }
-
-private:
-    std::string socketPath_;
-    std::string logPath_;
-    pid_t pid_ = -1;
-};
 
 class KorvsnmpcdDaemon : public ::testing::Test {
 protected:
@@ -523,30 +411,30 @@ protected:
     // here would race with its bind. It replaces a stale socket file itself.
     void SetUp() override
     {
-        ASSERT_GT(daemon_.Pid(), 0) << "cannot start " << KORVSNMPCD_PATH;
-        ASSERT_TRUE(daemon_.WaitUntilAnswering()) << daemon_.Log();
+        ASSERT_GT(daemon_->Pid(), 0) << "cannot start " << KORVSNMPCD_PATH;
+        ASSERT_TRUE(korvtest::WaitUntilConnectable(path_)) << daemon_->Log();
     }
     void TearDown() override
     {
         EXPECT_TRUE(Answers(path_)) << "the daemon no longer answers";
-        EXPECT_EQ(daemon_.Stop(), 0) << daemon_.Log();
+        EXPECT_EQ(daemon_->Stop(SIGTERM), 0) << daemon_->Log();
         EXPECT_NE(access(path_.c_str(), F_OK), 0) << "socket file left behind";
     }
 
     const std::string path_ = TestSocketPath("main");
-    Daemon daemon_{path_};
+    std::unique_ptr<CollectorProcess> daemon_ = StartDaemon(path_);
 };
 
 TEST_F(KorvsnmpcdDaemon, StatisticsReplyHasEverySection)
 {
     const std::string frame = korvproto::EncodeRequestFrame(StatisticsRequest());
-    Json::Value reply = korvtest::ParseJson(Exchange(path_, frame));
+    Json::Value reply = korvtest::ParseJson(korvtest::ExchangeWith(path_, frame));
     const Json::Value &data = reply["data"];
     ASSERT_TRUE(data.isObject()) << reply;
     EXPECT_EQ(data["System"].size(), 1u);
     ASSERT_EQ(data["Memory"].size(), 1u);
     korvsnmpcd::MemoryInfo memory;
-    ASSERT_TRUE(korvsnmpcd::ParseMemoryInfo(ReadFile("/proc/meminfo"), memory));
+    ASSERT_TRUE(korvsnmpcd::ParseMemoryInfo(korvtest::ReadWholeFile("/proc/meminfo"), memory));
     EXPECT_EQ(data["Memory"][0]["total_real"].asUInt(), memory.totalKiB);
 
     std::vector<std::string> interfaces;
@@ -581,16 +469,16 @@ TEST_F(KorvsnmpcdDaemon, ControlRequestsSucceedAndLogTheReason)
     Json::Value history;
     history["request"] = "history_mode";
     history["reason"] = "nightly backup";
-    EXPECT_EQ(Exchange(path_, korvproto::EncodeRequestFrame(reload)), "{\"success\":true}");
-    EXPECT_EQ(Exchange(path_, korvproto::EncodeRequestFrame(history)), "{\"success\":true}");
-    EXPECT_THAT(daemon_.Log(), HasSubstr("History mode requested, reason: [nightly backup]"));
-    EXPECT_THAT(daemon_.Log(), HasSubstr("Reload requested"));
+    EXPECT_EQ(korvtest::ExchangeWith(path_, korvproto::EncodeRequestFrame(reload)), "{\"success\":true}");
+    EXPECT_EQ(korvtest::ExchangeWith(path_, korvproto::EncodeRequestFrame(history)), "{\"success\":true}");
+    EXPECT_THAT(daemon_->Log(), HasSubstr("History mode requested, reason: [nightly backup]"));
+    EXPECT_THAT(daemon_->Log(), HasSubstr("Reload requested"));
 }
 
 TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDropped)
 {
     const std::string garbage = korvproto::EncodeFramePrefix(8) + "garbage!";
-    EXPECT_EQ(korvtest::ParseJson(Exchange(path_, garbage))["success"], false);
+    EXPECT_EQ(korvtest::ParseJson(korvtest::ExchangeWith(path_, garbage))["success"], false);
 
     struct Case {
         const char *what;
@@ -612,35 +500,13 @@ TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDropped)
     }
 }
 
-TEST_F(KorvsnmpcdDaemon, StalledClientsAreClosedAfterTheWaitWithoutHoldingUpOthers)
-{
-    UniqueFd silent = Connect(path_);
-    UniqueFd partial = Connect(path_);
-    ASSERT_TRUE(silent.Valid() && partial.Valid());
-    ASSERT_TRUE(SendAll(partial.Get(), korvproto::EncodeFramePrefix(1000) + "{\"resourc"));
-    Clock::time_point start = Clock::now();
-
-    // A good client is served at once, while both stalled ones still hold their connections.
-    EXPECT_TRUE(Answers(path_));
-    EXPECT_LT(Clock::now() - start, kPrompt);
-
-    for (int fd : {silent.Get(), partial.Get()}) {
-        bool closed = false;
-        EXPECT_EQ(ReadUntilClosed(fd, closed), "");
-        EXPECT_TRUE(closed);
-    }
-    auto waited = Clock::now() - start;
-    EXPECT_GE(waited, kClientTimeoutMs - std::chrono::milliseconds(50));
-    EXPECT_LT(waited, kClientTimeoutMs + std::chrono::seconds(2));
-}
-
 TEST_F(KorvsnmpcdDaemon, HundredsOfConnectionsInARowLeakNothing)
 {
     ASSERT_TRUE(Answers(path_));
-    size_t descriptors = OpenDescriptors(daemon_.Pid());
+    size_t descriptors = korvtest::OpenDescriptorCount(daemon_->Pid());
     const std::string frame = korvproto::EncodeRequestFrame(StatisticsRequest());
     for (int i = 0; i < 300; ++i)
-        ASSERT_TRUE(korvtest::ParseJson(Exchange(path_, frame))["data"].isObject()) << "exchange " << i;
+        ASSERT_TRUE(korvtest::ParseJson(korvtest::ExchangeWith(path_, frame))["data"].isObject()) << "exchange " << i;
     // Clients that leave without waiting for their reply.
     for (int i = 0; i < 300; ++i) {
         UniqueFd fd = Connect(path_);
@@ -650,23 +516,23 @@ TEST_F(KorvsnmpcdDaemon, HundredsOfConnectionsInARowLeakNothing)
     ASSERT_TRUE(Answers(path_));
     // The daemon closes the last of them as it notices that their clients left.
     Clock::time_point giveUp = Clock::now() + kPeerWait;
-    while (OpenDescriptors(daemon_.Pid()) != descriptors && Clock::now() < giveUp)
+    while (korvtest::OpenDescriptorCount(daemon_->Pid()) != descriptors && Clock::now() < giveUp)
         std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    EXPECT_EQ(OpenDescriptors(daemon_.Pid()), descriptors);
+    EXPECT_EQ(korvtest::OpenDescriptorCount(daemon_->Pid()), descriptors);
 }
 
 TEST(KorvsnmpcdLifecycle, SecondDaemonRefusesToStart)
 {
     const std::string path = TestSocketPath("twice");
     unlink(path.c_str());
-    Daemon first(path);
-    ASSERT_TRUE(first.WaitUntilAnswering()) << first.Log();
-    Daemon second(path);
-    EXPECT_EQ(second.WaitForExit(), 1);
-    EXPECT_THAT(second.Log(), HasSubstr("Another collector already answers on [" + path +
+    auto first = StartDaemon(path);
+    ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << first->Log();
+    auto second = StartDaemon(path);
+    EXPECT_EQ(second->WaitForExit(), 1);
+    EXPECT_THAT(second->Log(), HasSubstr("Another collector already answers on [" + path +
                                         "]; not starting"));
     EXPECT_TRUE(Answers(path));
-    EXPECT_EQ(first.Stop(SIGINT), 0);
+    EXPECT_EQ(first->Stop(SIGINT), 0);
     EXPECT_NE(access(path.c_str(), F_OK), 0);
 }
 
@@ -680,18 +546,18 @@ TEST(KorvsnmpcdLifecycle, StaleSocketIsReplacedButNoOtherFile)
         ASSERT_EQ(bind(stale.Get(), reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
     }
     {
-        Daemon daemon(path);
-        ASSERT_TRUE(daemon.WaitUntilAnswering()) << daemon.Log();
+        auto daemon = StartDaemon(path);
+        ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << daemon->Log();
         EXPECT_TRUE(Answers(path));
-        EXPECT_THAT(daemon.Log(), HasSubstr("Replaced the stale socket file [" + path + "]"));
-        EXPECT_EQ(daemon.Stop(), 0);
+        EXPECT_THAT(daemon->Log(), HasSubstr("Replaced the stale socket file [" + path + "]"));
+        EXPECT_EQ(daemon->Stop(SIGTERM), 0);
     }
 
     std::ofstream(path) << "keep me";
-    Daemon refused(path);
-    EXPECT_EQ(refused.WaitForExit(), 1);
-    EXPECT_THAT(refused.Log(), HasSubstr("exists and is not a socket; not replacing it"));
-    EXPECT_EQ(ReadFile(path), "keep me");
+    auto refused = StartDaemon(path);
+    EXPECT_EQ(refused->WaitForExit(), 1);
+    EXPECT_THAT(refused->Log(), HasSubstr("exists and is not a socket; not replacing it"));
+    EXPECT_EQ(korvtest::ReadWholeFile(path), "keep me");
     unlink(path.c_str());
 }
 

@@ -41,7 +41,9 @@ libkorvsnmp-dev + /usr/lib/pkgconfig/korvsnmp.pc
 libkorvsnmp-dev + /usr/lib/cmake/korvsnmp/korvsnmpConfig.cmake
 libkorvsnmp-dev - /usr/lib/libkorvsnmp.so.1
 korvsnmp-tools + /usr/bin/korvsnmp-stat
-korvsnmp-tools + /usr/bin/korvsnmpcd
+korvsnmp-tools + /usr/sbin/korvsnmpcd
+korvsnmp-tools + /usr/share/man/man8/korvsnmpcd.8.gz
+korvsnmp-tools + /usr/lib/systemd/system/korvsnmpcd.service
 korvsnmp-tools + /usr/share/man/man1/korvsnmp-stat.1.gz
 korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
 LIST
@@ -58,7 +60,7 @@ depends libkorvsnmp-dev | grep -q "libjsoncpp-dev" || fail "libkorvsnmp-dev need
 
 # lintian: no error and no warning, but for these, with their reasons:
 #   initial-upload-closes-no-bugs: the packages go to no Debian archive;
-#   no-manual-page: korvsnmpcd's page comes with the collector's service work.
+#   no-manual-page: korvsnmp-agentx has no page yet.
 lintian --fail-on error,warning --suppress-tags initial-upload-closes-no-bugs,no-manual-page \
     "$work"/out/*.deb >"$work/lintian.log" 2>&1 || { cat "$work/lintian.log"; fail "lintian"; }
 

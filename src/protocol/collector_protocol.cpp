@@ -60,7 +60,6 @@ RequestDecoder::State RequestDecoder::Feed(const char *data, size_t size)
                 state_ = State::kInvalid;
                 break;
             }
-            body_.reserve(length_);
             continue;
         }
         size_t take = std::min<size_t>(size, length_ - body_.size());

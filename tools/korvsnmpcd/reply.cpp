@@ -111,7 +111,7 @@ std::string StatisticsReplyText(const Rates &rates, const Snapshot &sample)
     return korvproto::CompactJson(StatisticsReply(rates, sample));
 }
 
-std::string AnswerRequest(std::string_view body, const std::string &statisticsReply)
+RequestKind ReadRequest(std::string_view body)
 {
     while (!body.empty() && body.back() == '\0')
         body.remove_suffix(1);
@@ -126,24 +126,30 @@ std::string AnswerRequest(std::string_view body, const std::string &statisticsRe
     } catch (const Json::Exception &) {
         // The reader gives up on very deep nesting by throwing: not an object either.
     }
-    if (!parsed || !request.isObject()) {
-        KORVSNMP_LOG(LOG_WARNING, "Refused a request that is not a JSON object");
-        return korvproto::CompactJson(Refusal("the request is not a JSON object"));
-    }
+    if (!parsed || !request.isObject())
+        return RequestKind::kNotAnObject;
 
     const Json::Value &object = request;
     const Json::Value &kind = object["request"];
     if (kind.isString() && kind.asString() == kReloadRequest) {
         KORVSNMP_LOG(LOG_NOTICE, "Reload requested; nothing to reload, sampling goes on");
-    } else if (kind.isString() && kind.asString() == kHistoryModeRequest) {
+        return RequestKind::kControl;
+    }
+    if (kind.isString() && kind.asString() == kHistoryModeRequest) {
         const Json::Value &reason = object["reason"];
         std::string text = reason.isString() ? reason.asString()
                            : reason.isNull() ? std::string()
                                              : korvproto::CompactJson(reason);
         KORVSNMP_LOG(LOG_NOTICE, "History mode requested, reason: [%s]", text.c_str());
-    } else {
-        return statisticsReply;
+        return RequestKind::kControl;
     }
+    return RequestKind::kStatistics;
+}
+
+std::string ControlReply(RequestKind kind)
+{
+    if (kind == RequestKind::kNotAnObject)
+        return korvproto::CompactJson(Refusal("the request is not a JSON object"));
     Json::Value success(Json::objectValue);
     success["success"] = true;
     return korvproto::CompactJson(success);

@@ -20,12 +20,20 @@ Json::Value StatisticsReply(const Rates &rates, const Snapshot &sample);
 // The same, as compact JSON text.
 std::string StatisticsReplyText(const Rates &rates, const Snapshot &sample);
 
-// The reply body to one request body (JSON text; trailing NULs are ignored):
-// {"request":"reload"} and {"request":"history_mode","reason":...} are
-// answered {"success":true} and logged; any other JSON object is a
-// statistics request, answered with `statisticsReply`; anything else is
-// answered {"success":false,"error":...}. Never throws but std::bad_alloc.
-std::string AnswerRequest(std::string_view body, const std::string &statisticsReply);
+enum class RequestKind {
+    kStatistics,   // any JSON object that is not a control request
+    kControl,      // {"request":"reload"} or {"request":"history_mode","reason":...}
+    kNotAnObject,  // anything else: refused
+};
+
+// The kind of one request body (JSON text; trailing NULs are ignored). Logs
+// each control request (the reload, the history mode's reason); logs nothing
+// for the others. Never throws but std::bad_alloc.
+RequestKind ReadRequest(std::string_view body);
+
+// The reply body to a request of `kind`, kControl or kNotAnObject:
+// {"success":true}, or {"success":false,"error":...}.
+std::string ControlReply(RequestKind kind);
 
 }  // namespace korvsnmpcd
 

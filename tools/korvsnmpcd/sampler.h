@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "rates.h"
+#include "statistics_source.h"
 
 namespace korvsnmpcd {
 
@@ -22,7 +23,7 @@ struct SourcePaths {
     std::string sysBlock = "/sys/block";
 };
 
-class Sampler {
+class Sampler : public StatisticsSource {
 public:
     // Takes the first sample; until the second one every rate is 0.
     explicit Sampler(SourcePaths paths = SourcePaths());
@@ -32,6 +33,9 @@ public:
 
     // The whole reply body to a statistics request.
     const std::string &StatisticsReply() const { return reply_; }
+
+    void Tick() override { Sample(); }
+    const std::string &Reply() override { return reply_; }
 
 private:
     Snapshot TakeSnapshot();

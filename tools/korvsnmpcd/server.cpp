@@ -1,7 +1,8 @@
 #include "server.h"
 
-#include <poll.h>
 #include <signal.h>
+#include <sys/epoll.h>
+#include <sys/resource.h>
 #include <sys/signalfd.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -9,17 +10,28 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <cstring>
+#include <vector>
 
 #include "protocol/unit_log.h"
 #include "reply.h"
+#include "reply_file.h"
 
 namespace korvsnmpcd {
 namespace {
 
 constexpr char kLogUnit[] = "server";
-constexpr mode_t kSocketMode = 0666;  // every local user may ask for statistics
 constexpr size_t kReadChunk = 4096;
+// The kernel caps it at net.core.somaxconn; every pending connection is
+// accepted in one round, so the backlog only has to hold one round's arrivals.
+constexpr int kListenBacklog = 4096;
+constexpr size_t kAcceptRound = kListenBacklog;
+// Descriptors kept beside the connections: the listener, the signals, the
+// poller, syslog's socket, the statistics files being read.
+constexpr rlim_t kSpareDescriptors = 64;
+constexpr int kEventBatch = 256;
+constexpr auto kLongestWait = std::chrono::seconds(1);
 
 using Clock = std::chrono::steady_clock;
 
@@ -52,6 +64,16 @@ int MillisecondsUntil(Clock::time_point when, Clock::time_point now)
 
 }  // namespace
 
+bool SomethingListensOn(const std::string &path)
+{
+    sockaddr_un address;
+    if (!FillAddress(path, address)) {
+        errno = ENAMETOOLONG;
+        return false;
+    }
+    return SomeoneAnswers(address);
+}
+
 struct Server::Connection {
     UniqueFd fd;
     Clock::time_point deadline;
@@ -59,9 +81,15 @@ struct Server::Connection {
     std::string reply;  // the whole reply frame, once the request is in
     size_t sent = 0;
     bool done = false;
+    std::list<Connection>::iterator self;
 };
 
-Server::Server(ServerOptions options) : options_(std::move(options)) {}
+Server::Server(ServerOptions options)
+    : options_(std::move(options))
+{
+    for (size_t event = 0; event < kEventKinds; ++event)
+        throttles_.emplace_back(options_.logPeriod);
+}
 
 Server::~Server()
 {
@@ -86,7 +114,51 @@ bool Server::Listen()
         KORVSNMP_LOG(LOG_ERR, "Cannot watch the stop signals: %m");
         return false;
     }
-    return TakeSocketPath();
+    poller_ = UniqueFd(epoll_create1(EPOLL_CLOEXEC));
+    if (!poller_.Valid()) {
+        KORVSNMP_LOG(LOG_ERR, "Cannot create the poller: %m");
+        return false;
+    }
+    return FitConnectionCap() && TakeSocketPath() && Watch(signals_.Get(), EPOLLIN, &signals_) &&
+           Watch(listening_.Get(), EPOLLIN, &listening_);
+}
+
+bool Server::FitConnectionCap()
+{
+    rlimit limit;
+    if (getrlimit(RLIMIT_NOFILE, &limit) != 0) {
+        KORVSNMP_LOG(LOG_ERR, "Cannot read the descriptor limit: %m");
+        return false;
+    }
+    rlim_t wanted = static_cast<rlim_t>(options_.maxConnections) + kSpareDescriptors;
+    if (limit.rlim_cur < wanted) {
+        limit.rlim_cur = std::min(wanted, limit.rlim_max);
+        if (setrlimit(RLIMIT_NOFILE, &limit) != 0 || getrlimit(RLIMIT_NOFILE, &limit) != 0)
+            KORVSNMP_LOG(LOG_WARNING, "Cannot raise the descriptor limit: %m");
+    }
+    if (limit.rlim_cur < wanted) {
+        if (limit.rlim_cur <= kSpareDescriptors) {
+            KORVSNMP_LOG(LOG_ERR, "The descriptor limit %llu leaves no room for connections",
+                           static_cast<unsigned long long>(limit.rlim_cur));
+            return false;
+        }
+        options_.maxConnections = static_cast<size_t>(limit.rlim_cur - kSpareDescriptors);
+        KORVSNMP_LOG(LOG_NOTICE, "Serving at most %zu connections at once (descriptor limit %llu)",
+                       options_.maxConnections, static_cast<unsigned long long>(limit.rlim_cur));
+    }
+    return true;
+}
+
+bool Server::Watch(int fd, uint32_t events, void *tag)
+{
+    epoll_event event{};
+    event.events = events;
+    event.data.ptr = tag;
+    if (epoll_ctl(poller_.Get(), EPOLL_CTL_ADD, fd, &event) != 0) {
+        KORVSNMP_LOG(LOG_ERR, "Cannot watch descriptor %d: %m", fd);
+        return false;
+    }
+    return true;
 }
 
 bool Server::TakeSocketPath()
@@ -140,96 +212,158 @@ bool Server::TakeSocketPath()
     }
     if (chmod(path, kSocketMode) != 0)
         KORVSNMP_LOG(LOG_WARNING, "Cannot open [%s] to every local user: %m", path);
-    if (listen(listening_.Get(), SOMAXCONN) != 0) {
+    if (listen(listening_.Get(), kListenBacklog) != 0) {
         KORVSNMP_LOG(LOG_ERR, "Cannot listen on [%s]: %m", path);
         return false;
     }
     return true;
 }
 
-bool Server::Run(Sampler &sampler)
+bool Server::Run(StatisticsSource &source)
 {
-    Clock::time_point nextSample = Clock::now() + options_.interval;
-    std::vector<pollfd> watched;
+    Clock::time_point nextTick = Clock::now() + options_.interval;
+    epoll_event events[kEventBatch];
+    std::vector<Connection *> finished;
     while (true) {
         Clock::time_point now = Clock::now();
-        if (now >= nextSample) {
-            sampler.Sample();
+        if (now >= nextTick) {
+            source.Tick();
             now = Clock::now();
             // A late tick (a suspended host) is not made up for with a burst of samples.
-            while (nextSample <= now)
-                nextSample += options_.interval;
+            while (nextTick <= now)
+                nextTick += options_.interval;
         }
+        CloseExpired(now);
+        LogDueCounts(now);
 
-        for (auto &connection : connections_) {
-            if (connection->deadline <= now)
-                connection->done = true;
-        }
-        connections_.erase(std::remove_if(connections_.begin(), connections_.end(),
-                                          [](const auto &c) { return c->done; }),
-                           connections_.end());
-
-        Clock::time_point wakeUp = nextSample;
-        watched.clear();
-        watched.push_back({signals_.Get(), POLLIN, 0});
-        bool accepting = connections_.size() < options_.maxConnections;
-        watched.push_back({accepting ? listening_.Get() : -1, POLLIN, 0});
-        for (const auto &connection : connections_) {
-            short events = connection->reply.empty() ? POLLIN : POLLOUT;
-            watched.push_back({connection->fd.Get(), events, 0});
-            wakeUp = std::min(wakeUp, connection->deadline);
-        }
-
-        int ready = poll(watched.data(), watched.size(), MillisecondsUntil(wakeUp, now));
+        Clock::time_point wakeUp = std::min(nextTick, now + kLongestWait);
+        if (!connections_.empty())
+            wakeUp = std::min(wakeUp, connections_.front().deadline);
+        int ready = epoll_wait(poller_.Get(), events, kEventBatch, MillisecondsUntil(wakeUp, now));
         if (ready < 0 && errno != EINTR) {
-            KORVSNMP_LOG(LOG_ERR, "poll() failed: %m");
+            KORVSNMP_LOG(LOG_ERR, "epoll_wait() failed: %m");
             return false;
         }
-        if (ready <= 0)
-            continue;
 
-        if (watched[0].revents != 0) {
-            signalfd_siginfo info;
-            if (read(signals_.Get(), &info, sizeof info) == static_cast<ssize_t>(sizeof info)) {
-                KORVSNMP_LOG(LOG_NOTICE, "Stopping on signal %u", info.ssi_signo);
-                return true;
+        bool acceptNow = false;
+        finished.clear();
+        for (int i = 0; i < ready; ++i) {
+            void *tag = events[i].data.ptr;
+            if (tag == &signals_) {
+                signalfd_siginfo info;
+                if (read(signals_.Get(), &info, sizeof info) == static_cast<ssize_t>(sizeof info)) {
+                    KORVSNMP_LOG(LOG_NOTICE, "Stopping on signal %u", info.ssi_signo);
+                    return true;
+                }
+            } else if (tag == &listening_) {
+                acceptNow = true;
+            } else {
+                Connection &connection = *static_cast<Connection *>(tag);
+                if (connection.reply.empty())
+                    Receive(connection, source);
+                else
+                    Send(connection);
+                if (connection.done)
+                    finished.push_back(&connection);
             }
         }
-        // Connections accepted now are watched from the next round on.
-        size_t watchedConnections = watched.size() - 2;
-        for (size_t i = 0; i < watchedConnections; ++i) {
-            short events = watched[i + 2].revents;
-            if (events == 0)
-                continue;
-            Connection &connection = *connections_[i];
-            if (connection.reply.empty())
-                Receive(connection, sampler);
-            else
-                Send(connection);
-        }
-        if (watched[1].revents != 0)
+        // No event of this batch refers to a connection any more.
+        for (Connection *connection : finished)
+            connections_.erase(connection->self);
+        if (acceptNow)
             AcceptPending();
     }
 }
 
 void Server::AcceptPending()
 {
-    while (connections_.size() < options_.maxConnections) {
+    for (size_t round = 0; round < kAcceptRound; ++round) {
+        if (connections_.size() >= options_.maxConnections)
+            MakeRoom();
         UniqueFd fd(accept4(listening_.Get(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
         if (!fd.Valid()) {
-            if (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR &&
-                errno != ECONNABORTED)
-                KORVSNMP_LOG(LOG_ERR, "accept() failed: %m");
-            return;
+            if (errno == EAGAIN || errno == EWOULDBLOCK)
+                return;
+            if (errno == EINTR || errno == ECONNABORTED)
+                continue;
+            lastAcceptError_ = errno;
+            Note(Event::kAcceptFailed, Clock::now());
+            // Out of descriptors or memory: give the oldest connection's up.
+            if (connections_.empty())
+                return;
+            connections_.pop_front();
+            continue;
         }
-        auto connection = std::make_unique<Connection>();
-        connection->fd = std::move(fd);
-        connection->deadline = Clock::now() + options_.clientTimeout;
-        connections_.push_back(std::move(connection));
+        connections_.emplace_back();
+        Connection &connection = connections_.back();
+        connection.self = std::prev(connections_.end());
+        connection.fd = std::move(fd);
+        connection.deadline = Clock::now() + options_.clientTimeout;
+        if (!Watch(connection.fd.Get(), EPOLLIN, &connection))
+            connections_.pop_back();
     }
 }
 
-void Server::Receive(Connection &connection, const Sampler &sampler)
+void Server::MakeRoom()
+{
+    auto unfinished = std::find_if(connections_.begin(), connections_.end(),
+                                   [](const Connection &c) { return c.reply.empty(); });
+    connections_.erase(unfinished != connections_.end() ? unfinished : connections_.begin());
+    Note(Event::kEvicted, Clock::now());
+}
+
+void Server::CloseExpired(Clock::time_point now)
+{
+    while (!connections_.empty() && connections_.front().deadline <= now) {
+        connections_.pop_front();
+        Note(Event::kTimedOut, now);
+    }
+}
+
+void Server::Note(Event event, Clock::time_point now)
+{
+    if (uint64_t n = throttles_[static_cast<size_t>(event)].Record(now))
+        Report(event, n);
+}
+
+void Server::LogDueCounts(Clock::time_point now)
+{
+    for (size_t event = 0; event < kEventKinds; ++event) {
+        if (uint64_t n = throttles_[event].Due(now))
+            Report(static_cast<Event>(event), n);
+    }
+}
+
+void Server::Report(Event event, uint64_t n)
+{
+    auto count = static_cast<unsigned long long>(n);
+    switch (event) {
+    case Event::kRefusedFrame:
+        KORVSNMP_LOG(LOG_WARNING, "Refused %llu request frame(s) whose length is 0 or beyond %u",
+                       count, korvproto::kMaxRequestBytes);
+        break;
+    case Event::kRefusedBody:
+        KORVSNMP_LOG(LOG_WARNING, "Refused %llu request(s) that are not a JSON object", count);
+        break;
+    case Event::kTimedOut:
+        KORVSNMP_LOG(LOG_NOTICE,
+                       "Closed %llu connection(s) that did not finish their exchange within "
+                       "%lld ms",
+                       count, static_cast<long long>(options_.clientTimeout.count()));
+        break;
+    case Event::kEvicted:
+        KORVSNMP_LOG(LOG_WARNING,
+                       "Closed %llu unfinished connection(s) to stay within %zu connections",
+                       count, options_.maxConnections);
+        break;
+    case Event::kAcceptFailed:
+        KORVSNMP_LOG(LOG_ERR, "accept() failed %llu time(s), last: %s", count,
+                       strerror(lastAcceptError_));
+        break;
+    }
+}
+
+void Server::Receive(Connection &connection, StatisticsSource &source)
 {
     char buffer[kReadChunk];
     while (connection.request.Current() == RequestDecoder::State::kIncomplete) {
@@ -245,14 +379,36 @@ void Server::Receive(Connection &connection, const Sampler &sampler)
         connection.request.Feed(buffer, static_cast<size_t>(got));
     }
     if (connection.request.Current() == RequestDecoder::State::kInvalid) {
-        KORVSNMP_LOG(LOG_WARNING, "Closed a connection whose request length is 0 or beyond %u",
-                       korvproto::kMaxRequestBytes);
+        Note(Event::kRefusedFrame, Clock::now());
         connection.done = true;
         return;
     }
-    connection.reply = korvproto::EncodeFrame(AnswerRequest(connection.request.Body(),
-                                                sampler.StatisticsReply()));
+    Answer(connection, source);
+}
+
+void Server::Answer(Connection &connection, StatisticsSource &source)
+{
+    RequestKind kind = ReadRequest(connection.request.Body());
+    if (kind != RequestKind::kStatistics) {
+        if (kind == RequestKind::kNotAnObject)
+            Note(Event::kRefusedBody, Clock::now());
+        connection.reply = korvproto::EncodeFrame(ControlReply(kind));
+    } else {
+        const std::string &statistics = source.Reply();
+        if (!options_.recordPath.empty()) {
+            RecordReply(options_.recordPath, statistics);
+            options_.recordPath.clear();  // only the next reply, kept or not
+        }
+        connection.reply = korvproto::EncodeFrame(statistics);
+    }
     Send(connection);
+    if (!connection.done) {
+        epoll_event event{};
+        event.events = EPOLLOUT;
+        event.data.ptr = &connection;
+        if (epoll_ctl(poller_.Get(), EPOLL_CTL_MOD, connection.fd.Get(), &event) != 0)
+            connection.done = true;
+    }
 }
 
 void Server::Send(Connection &connection)
