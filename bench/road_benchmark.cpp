@@ -3,16 +3,27 @@
 // two aggregations, 64 spaces with flash caches, 512 LUNs.
 //
 //   floor:    the reply's bytes over the UNIX socket, parsed by Json::Reader
-//   road:     Transmit + GetDataJson + SNMPParseReplyData
-//   assembly: SNMPParseReplyData alone
-//   copy:     a deep copy of the reply's sections, the least that taking
-//             them over into a result costs
+//   road:     Transmit + GetDataJson + SNMPParseReplyData (copying the reply)
+//   moving road: the same, the parsed reply handed over with std::move
+//   assembly, moving assembly: SNMPParseReplyData alone
+//   platform: the time that a moving road spends inside the platform's
+//             operations and the system calls that the spaces need
 //
-// After the runs it prints road/floor, assembly/floor and the peak memory of
-// one whole-road call over the reply's size. Needs root (it makes block
-// device nodes for the spaces) and takes over /tmp/korvsnmpcd.sock.
+// Without arguments it measures the peak memory of one road (every malloc of
+// the process counted), then runs the probes interleaved, one iteration of
+// each in turn (--interleaved=<rounds>, 200 by default), and ends with the
+// medians' ratios as "NAME: VALUE" lines: road/floor, moving road/floor,
+// own share/floor (moving road - floor - platform), moving peak/reply, and
+// the load average. Google Benchmark's flags (--benchmark_...) add its runs;
+// with --benchmark_repetitions it prints the medians' ratios.
+//
+// Needs root (it makes block device nodes for the spaces) and takes over
+// /tmp/korvsnmpcd.sock.
 #include <arpa/inet.h>
+#include <dlfcn.h>
+#include <linux/perf_event.h>
 #include <malloc.h>
+#include <sys/syscall.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
@@ -21,13 +32,14 @@
 
 #include <algorithm>
 #include <atomic>
+#include <cerrno>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <ctime>
 #include <filesystem>
 #include <map>
-#include <new>
 #include <string>
 #include <thread>
 #include <vector>
@@ -37,41 +49,242 @@
 #include <json/writer.h>
 
 #include "korv_standin.h"
+#include "korv_webapi.h"
 #include "korvsnmp/korvsnmp.h"
 
-// ---- Allocation accounting, for the peak memory of one call ---------------
+// ---- Allocation accounting at malloc, for the peak memory of one call -----
+//
+// The program defines malloc and its relatives, so every allocation of the
+// process (jsoncpp's strings and keys, the standard library's, the
+// library's) comes through here. Blocks are counted by their usable size.
+// The sanitizers bring their own allocator: there the peak is not counted.
+#if defined(__SANITIZE_ADDRESS__)
+constexpr bool kCountsAllocations = false;
+#else
+constexpr bool kCountsAllocations = true;
+#endif
 
 namespace {
 std::atomic<long long> gLiveBytes{0};
 std::atomic<long long> gPeakBytes{0};
 
-void *Allocate(size_t size)
-{
-    void *block = std::malloc(size ? size : 1);
-    if (block == nullptr)
-        throw std::bad_alloc();
-    long long live = gLiveBytes += static_cast<long long>(malloc_usable_size(block));
-    long long peak = gPeakBytes.load();
-    while (live > peak && !gPeakBytes.compare_exchange_weak(peak, live)) {
-    }
-    return block;
-}
-
-void Release(void *block)
+void Count(void *block)
 {
     if (block == nullptr)
         return;
-    gLiveBytes -= static_cast<long long>(malloc_usable_size(block));
-    std::free(block);
+    long long live = gLiveBytes.fetch_add(static_cast<long long>(malloc_usable_size(block)),
+                                          std::memory_order_relaxed) +
+                     static_cast<long long>(malloc_usable_size(block));
+    long long peak = gPeakBytes.load(std::memory_order_relaxed);
+    while (live > peak && !gPeakBytes.compare_exchange_weak(peak, live, std::memory_order_relaxed)) {
+    }
+}
+
+void Uncount(void *block)
+{
+    if (block != nullptr)
+        gLiveBytes.fetch_sub(static_cast<long long>(malloc_usable_size(block)),
+                             std::memory_order_relaxed);
 }
 }  // namespace
 
-void *operator new(size_t size) { return Allocate(size); }
-void *operator new[](size_t size) { return Allocate(size); }
-void operator delete(void *block) noexcept { Release(block); }
-void operator delete[](void *block) noexcept { Release(block); }
-void operator delete(void *block, size_t) noexcept { Release(block); }
-void operator delete[](void *block, size_t) noexcept { Release(block); }
+#if !defined(__SANITIZE_ADDRESS__)
+extern "C" {
+void *__libc_malloc(size_t size);
+void *__libc_calloc(size_t count, size_t size);
+void *__libc_realloc(void *block, size_t size);
+void *__libc_memalign(size_t alignment, size_t size);
+void __libc_free(void *block);
+
+void *malloc(size_t size)
+{
+    void *block = __libc_malloc(size);
+    Count(block);
+    return block;
+}
+void *calloc(size_t count, size_t size)
+{
+    void *block = __libc_calloc(count, size);
+    Count(block);
+    return block;
+}
+void *realloc(void *block, size_t size)
+{
+    Uncount(block);
+    void *moved = __libc_realloc(block, size);
+    // A failed realloc keeps the old block; a zero size may free it.
+    Count(moved != nullptr ? moved : (size != 0 ? block : nullptr));
+    return moved;
+}
+void free(void *block)
+{
+    Uncount(block);
+    __libc_free(block);
+}
+void *memalign(size_t alignment, size_t size)
+{
+    void *block = __libc_memalign(alignment, size);
+    Count(block);
+    return block;
+}
+void *aligned_alloc(size_t alignment, size_t size) { return memalign(alignment, size); }
+int posix_memalign(void **out, size_t alignment, size_t size)
+{
+    void *block = memalign(alignment, size);
+    if (block == nullptr)
+        return ENOMEM;
+    *out = block;
+    return 0;
+}
+}
+#endif
+
+// ---- The platform's own time ------------------------------------------------
+//
+// Every platform operation, and the system calls that the library must make
+// for the spaces (stat, readlink), pass through a wrapper here that forwards
+// to the real one. While timing is on, the wrappers add up the time spent
+// inside them (the outermost call only); otherwise they only forward.
+
+namespace {
+struct PlatformClock {
+    bool on = false;
+    int depth = 0;
+    long long platformNs = 0;
+    long long syscallNs = 0;
+    long long calls = 0;
+};
+thread_local PlatformClock tPlatform;
+
+long long NowNs()
+{
+    timespec now{};
+    clock_gettime(CLOCK_MONOTONIC, &now);
+    return now.tv_sec * 1000000000LL + now.tv_nsec;
+}
+
+template <typename Function>
+Function Next(const char *symbol)
+{
+    void *found = dlsym(RTLD_NEXT, symbol);
+    if (found == nullptr) {
+        std::fprintf(stderr, "benchmark: no %s after the program\n", symbol);
+        std::abort();
+    }
+    return reinterpret_cast<Function>(found);
+}
+
+// Runs `call`, adding its time to `sum` while timing is on.
+template <typename Call>
+auto Timed(long long PlatformClock::*sum, Call call)
+{
+    PlatformClock &clock = tPlatform;
+    if (!clock.on || clock.depth > 0)
+        return call();
+    ++clock.depth;
+    ++clock.calls;
+    const long long start = NowNs();
+    auto result = call();
+    clock.*sum += NowNs() - start;
+    --clock.depth;
+    return result;
+}
+
+template <typename Call>
+void TimedVoid(Call call)
+{
+    Timed(&PlatformClock::platformNs, [&] {
+        call();
+        return 0;
+    });
+}
+}  // namespace
+
+#define KORVBENCH_FORWARD(result, name, params, args)                                   \
+    extern "C" result name params                                                       \
+    {                                                                                   \
+        static const auto next = Next<result(*) params>(#name);                         \
+        return Timed(&PlatformClock::platformNs, [&] { return next args; });            \
+    }
+#define KORVBENCH_FORWARD_VOID(name, params, args)                                       \
+    extern "C" void name params                                                         \
+    {                                                                                   \
+        static const auto next = Next<void(*) params>(#name);                           \
+        TimedVoid([&] { next args; });                                                  \
+    }
+
+KORVBENCH_FORWARD(int, KLIBCIsQuillbox, (void), ())
+KORVBENCH_FORWARD(unsigned int, KLIBSystemPhysMemSizeGet, (void), ())
+KORVBENCH_FORWARD(int, KLIBCSzListFind, (const KLIBCSzList *list, const char *text), (list, text))
+KORVBENCH_FORWARD(KLIBCSzHash *, KLIBCSzHashAlloc, (int size), (size))
+KORVBENCH_FORWARD(int, KLIBCSzHashSetValue, (KLIBCSzHash * *hash, const char *key, const char *value),
+                  (hash, key, value))
+KORVBENCH_FORWARD(const char *, KLIBCSzHashGetValue, (const KLIBCSzHash *hash, const char *key),
+                  (hash, key))
+KORVBENCH_FORWARD_VOID(KLIBCSzHashFree, (KLIBCSzHash * hash), (hash))
+KORVBENCH_FORWARD(int, KLIBCFileGetSectionValue,
+                  (const char *path, const char *section, const char *key, char *buffer, int size),
+                  (path, section, key, buffer, size))
+KORVBENCH_FORWARD(unsigned int, KLIBCErrGet, (void), ())
+KORVBENCH_FORWARD(const char *, KLIBCErrorGetFile, (void), ())
+KORVBENCH_FORWARD(int, KLIBCErrorGetLine, (void), ())
+KORVBENCH_FORWARD(int, DiskInfoEnum, (const DiskFilter *filter, DiskInfoList **head), (filter, head))
+KORVBENCH_FORWARD_VOID(DiskInfoEnumFree, (DiskInfoList * head), (head))
+KORVBENCH_FORWARD(int, SupportEBox, (void), ())
+KORVBENCH_FORWARD(int, KORVEBoxInfoEnum, (EBoxInfo * *head), (head))
+KORVBENCH_FORWARD_VOID(KORVEBoxInfoEnumFree, (EBoxInfo * head), (head))
+KORVBENCH_FORWARD(int, KORVEBoxIsPoweron, (const EBoxInfo *unit), (unit))
+KORVBENCH_FORWARD(int, KORVUSBDevEnum, (int kind, char **names, int size, int *needed),
+                  (kind, names, size, needed))
+KORVBENCH_FORWARD(int, KORVExtStgPartsVolInfoGet, (const char *name, ExtStgPartsVolInfo *info, int isUsb),
+                  (name, info, isUsb))
+KORVBENCH_FORWARD(int, KLIBNetGetInterfaceInfo, (KLIBNetInterfaceInfo * records, int capacity, int flags),
+                  (records, capacity, flags))
+KORVBENCH_FORWARD(int, KLIBNetVlanGet, (const char *name, KLIBNetVlanInfo *vlan), (name, vlan))
+KORVBENCH_FORWARD(int, KLIBNetOVSIfIsMaster, (const char *name), (name))
+KORVBENCH_FORWARD(int, KORVNetLinkAggrGet, (const char *name, KORVNetLinkAggrInfo *aggr), (name, aggr))
+KORVBENCH_FORWARD(int, KORVPPPoeIntfGet, (char *name, int size), (name, size))
+KORVBENCH_FORWARD(int, KORVSpaceInfoEnum, (int flags, SpaceInfo **list), (flags, list))
+KORVBENCH_FORWARD_VOID(KORVSpaceInfoFree, (SpaceInfo * list), (list))
+KORVBENCH_FORWARD(int, KORVFlashCacheConfigGet, (int flags, FlashCacheConfig **list), (flags, list))
+KORVBENCH_FORWARD_VOID(KORVFlashCacheConfigFree, (FlashCacheConfig * list), (list))
+KORVBENCH_FORWARD(int, KORVVSpaceLayerPathGet,
+                  (int flags, const SpaceLayerRef *ref, char *buffer, int size),
+                  (flags, ref, buffer, size))
+
+int KORV::APIRunner::Exec(Json::Value &response, const std::string &api, int version,
+                          const std::string &method, const Json::Value &params,
+                          const std::string &user)
+{
+    using Function = int (*)(Json::Value &, const std::string &, int, const std::string &,
+                             const Json::Value &, const std::string &);
+    static const auto next = Next<Function>(
+        "_ZN4KORV9APIRunner4ExecERN4Json5ValueERKNSt7__cxx1112basic_stringIcSt11char_"
+        "traitsIcESaIcEEEiSB_RKS2_SB_");
+    return Timed(&PlatformClock::platformNs,
+                 [&] { return next(response, api, version, method, params, user); });
+}
+
+bool KORV::WebAPIUtil::JsonArrayHasString(const Json::Value &array, const std::string &name)
+{
+    using Function = bool (*)(const Json::Value &, const std::string &);
+    static const auto next = Next<Function>(
+        "_ZN4KORV10WebAPIUtil18JsonArrayHasStringERKN4Json5ValueERKNSt7__cxx1112basic_"
+        "stringIcSt11char_traitsIcESaIcEEE");
+    return Timed(&PlatformClock::platformNs, [&] { return next(array, name); });
+}
+
+extern "C" int stat(const char *__restrict path, struct stat *__restrict buffer) noexcept
+{
+    static const auto next = Next<int (*)(const char *, struct stat *)>("stat");
+    return Timed(&PlatformClock::syscallNs, [&] { return next(path, buffer); });
+}
+
+extern "C" ssize_t readlink(const char *__restrict path, char *__restrict buffer, size_t size) noexcept
+{
+    static const auto next = Next<ssize_t (*)(const char *, char *, size_t)>("readlink");
+    return Timed(&PlatformClock::syscallNs, [&] { return next(path, buffer, size); });
+}
 
 // The library's messages (failures only) go to standard error, not to the
 // system log.
@@ -243,10 +456,12 @@ std::string DescribeAppliance(const SpaceNodes &nodes)
     return Json::FastWriter().write(reply);
 }
 
-// Serves the framed reply to every connection, on its own thread.
+// Serves the framed reply to every connection, on its own thread. Everything
+// the thread needs is allocated before it starts, so that it never allocates
+// inside a measured window.
 class Collector {
 public:
-    explicit Collector(const std::string &reply) : reply_(reply)
+    explicit Collector(const std::string &reply) : request_(kRequestBufferSize)
     {
         unlink(kSocketPath);
         listenFd_ = socket(AF_UNIX, SOCK_STREAM, 0);
@@ -258,10 +473,12 @@ public:
             std::perror("benchmark collector");
             std::exit(1);
         }
-        uint32_t length = htonl(static_cast<uint32_t>(reply_.size()));
+        uint32_t length = htonl(static_cast<uint32_t>(reply.size()));
         frame_.assign(reinterpret_cast<char *>(&length), sizeof length);
-        frame_ += reply_;
+        frame_ += reply;
         server_ = std::thread([this] { Serve(); });
+        while (!serving_.load())
+            std::this_thread::yield();
     }
     ~Collector()
     {
@@ -283,15 +500,17 @@ public:
     }
 
 private:
+    static constexpr size_t kRequestBufferSize = 65536;
+
     // Reads one whole request frame: its length, then that many bytes.
-    static bool ReadRequest(int fd, std::vector<char> &buffer)
+    bool ReadRequest(int fd)
     {
         uint32_t length = 0;
         if (read(fd, &length, sizeof length) != static_cast<ssize_t>(sizeof length))
             return false;
-        size_t missing = std::min<size_t>(ntohl(length), buffer.size());
+        size_t missing = ntohl(length);
         while (missing > 0) {
-            ssize_t n = read(fd, buffer.data(), missing);
+            ssize_t n = read(fd, request_.data(), std::min(missing, request_.size()));
             if (n <= 0)
                 return false;
             missing -= static_cast<size_t>(n);
@@ -301,12 +520,12 @@ private:
 
     void Serve()
     {
-        std::vector<char> request(65536);
+        serving_ = true;
         while (!stop_) {
             int fd = accept(listenFd_, nullptr, nullptr);
             if (fd < 0)
                 continue;
-            if (!stop_ && ReadRequest(fd, request))
+            if (!stop_ && ReadRequest(fd))
                 for (size_t sent = 0; sent < frame_.size();) {
                     ssize_t n = write(fd, frame_.data() + sent, frame_.size() - sent);
                     if (n <= 0)
@@ -317,9 +536,10 @@ private:
         }
     }
 
-    std::string reply_;
+    std::vector<char> request_;
     std::string frame_;
     int listenFd_;
+    std::atomic<bool> serving_{false};
     std::atomic<bool> stop_{false};
     std::thread server_;
 };
@@ -331,122 +551,404 @@ Json::Value Request()
     return request;
 }
 
-void Floor(benchmark::State &state)
-{
-    const std::string text = Json::FastWriter().write(Request());
-    std::string frame(4, '\0');
-    uint32_t length = htonl(static_cast<uint32_t>(text.size() + 1));
-    std::memcpy(frame.data(), &length, 4);
-    frame.append(text.c_str(), text.size() + 1);
-    std::vector<char> piece(65536);
-    for (auto _ : state) {
+// ---- The probes: one iteration each ------------------------------------------
+
+struct Probes {
+    const Json::Value request = Request();
+    std::string requestFrame;
+    std::vector<char> piece = std::vector<char>(65536);
+    Json::Value parsedReply;
+
+    explicit Probes(const std::string &reply)
+    {
+        const std::string text = Json::FastWriter().write(request);
+        requestFrame.assign(4, '\0');
+        uint32_t length = htonl(static_cast<uint32_t>(text.size() + 1));
+        std::memcpy(requestFrame.data(), &length, 4);
+        requestFrame.append(text.c_str(), text.size() + 1);
+        Json::Reader().parse(reply, parsedReply);
+    }
+
+    // The reply's bytes over the socket, parsed: what any client pays.
+    bool Floor()
+    {
         int fd = Collector::Connect();
-        if (write(fd, frame.data(), frame.size()) != static_cast<ssize_t>(frame.size()))
-            state.SkipWithError("write");
+        bool sent = write(fd, requestFrame.data(), requestFrame.size()) ==
+                    static_cast<ssize_t>(requestFrame.size());
         std::string received;
         for (ssize_t n; (n = read(fd, piece.data(), piece.size())) > 0;)
             received.append(piece.data(), static_cast<size_t>(n));
         close(fd);
         Json::Value reply;
-        Json::Reader().parse(received.data() + 4, received.data() + received.size(), reply, true);
+        bool parsed = received.size() > 4 &&
+                      Json::Reader().parse(received.data() + 4, received.data() + received.size(),
+                                           reply, true);
         benchmark::DoNotOptimize(reply);
+        return sent && parsed;
     }
-}
 
-void Road(benchmark::State &state)
-{
-    const Json::Value request = Request();
-    for (auto _ : state) {
+    // Transmit + GetDataJson + SNMPParseReplyData, the reply copied or moved.
+    bool Road(bool moving)
+    {
         Transmitor transmitor("localhost");
         Json::Value reply, result(Json::objectValue);
-        if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(reply) != 0 ||
-            !SNMPParseReplyData(request, reply, result))
-            state.SkipWithError("the whole road failed");
+        if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(reply) != 0)
+            return false;
+        bool assembled = moving ? SNMPParseReplyData(request, std::move(reply), result)
+                                : SNMPParseReplyData(request, reply, result);
         benchmark::DoNotOptimize(result);
+        return assembled;
     }
+
+    bool Assembly()
+    {
+        Json::Value result(Json::objectValue);
+        bool assembled = SNMPParseReplyData(request, parsedReply, result);
+        benchmark::DoNotOptimize(result);
+        return assembled;
+    }
+
+    // `reply` is a fresh copy, made outside the measured time.
+    bool MovingAssembly(Json::Value &reply)
+    {
+        Json::Value result(Json::objectValue);
+        bool assembled = SNMPParseReplyData(request, std::move(reply), result);
+        benchmark::DoNotOptimize(result);
+        return assembled;
+    }
+};
+
+Probes *gProbes = nullptr;
+
+// ---- Google Benchmark runs (when its flags are given) --------------------------
+
+void BenchFloor(benchmark::State &state)
+{
+    for (auto _ : state)
+        if (!gProbes->Floor())
+            state.SkipWithError("the floor failed");
 }
 
-Json::Value gParsedReply;
-
-void Assembly(benchmark::State &state)
+void BenchRoad(benchmark::State &state)
 {
-    const Json::Value request = Request();
-    for (auto _ : state) {
-        Json::Value result(Json::objectValue);
-        if (!SNMPParseReplyData(request, gParsedReply, result))
+    for (auto _ : state)
+        if (!gProbes->Road(false))
+            state.SkipWithError("the whole road failed");
+}
+
+void BenchMovingRoad(benchmark::State &state)
+{
+    for (auto _ : state)
+        if (!gProbes->Road(true))
+            state.SkipWithError("the whole road failed");
+}
+
+void BenchAssembly(benchmark::State &state)
+{
+    for (auto _ : state)
+        if (!gProbes->Assembly())
             state.SkipWithError("assembly failed");
-        benchmark::DoNotOptimize(result);
+}
+
+void BenchMovingAssembly(benchmark::State &state)
+{
+    for (auto _ : state) {
+        state.PauseTiming();
+        Json::Value reply = gProbes->parsedReply;
+        state.ResumeTiming();
+        if (!gProbes->MovingAssembly(reply))
+            state.SkipWithError("assembly failed");
     }
 }
 
 // A deep copy of the reply's sections: what taking them over into a result
 // costs at the least, before any naming.
-void Copy(benchmark::State &state)
+void BenchCopy(benchmark::State &state)
 {
     for (auto _ : state) {
-        Json::Value copy = gParsedReply["data"];
+        Json::Value copy = gProbes->parsedReply["data"];
         benchmark::DoNotOptimize(copy);
     }
 }
 
-// Keeps each benchmark's mean time per iteration, for the ratios.
+// Keeps each benchmark's time per iteration: the median over the repetitions
+// when there are several, else the single run's mean.
 class RatioReporter : public benchmark::ConsoleReporter {
 public:
     void ReportRuns(const std::vector<Run> &runs) override
     {
-        for (const Run &run : runs)
-            if (run.run_type == Run::RT_Iteration && !run.error_occurred)
-                nanoseconds[run.benchmark_name()] = run.GetAdjustedRealTime();
+        for (const Run &run : runs) {
+            if (run.error_occurred)
+                continue;
+            const std::string name = run.run_name.str();
+            if (run.run_type == Run::RT_Aggregate && run.aggregate_name == "median")
+                medians[name] = run.GetAdjustedRealTime();
+            else if (run.run_type == Run::RT_Iteration)
+                singles[name] = run.GetAdjustedRealTime();
+        }
         ConsoleReporter::ReportRuns(runs);
     }
-    std::map<std::string, double> nanoseconds;
+    double Time(const std::string &name) const
+    {
+        auto median = medians.find(name);
+        if (median != medians.end())
+            return median->second;
+        auto single = singles.find(name);
+        return single != singles.end() ? single->second : 0;
+    }
+    bool HasMedians() const { return !medians.empty(); }
+
+private:
+    std::map<std::string, double> medians, singles;
 };
+
+void RunGoogleBenchmark(int argc, char **argv)
+{
+    benchmark::RegisterBenchmark("floor", BenchFloor)->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark("road", BenchRoad)->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark("moving road", BenchMovingRoad)->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark("assembly", BenchAssembly)->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark("moving assembly", BenchMovingAssembly)->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark("copy", BenchCopy)->Unit(benchmark::kMicrosecond);
+    benchmark::Initialize(&argc, argv);
+    RatioReporter reporter;
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+    const double floor = reporter.Time("floor");
+    if (floor <= 0)
+        return;
+    std::printf("Google Benchmark ratios to the floor (%s):\n",
+                reporter.HasMedians() ? "medians of the repetitions" : "means of one run");
+    for (const char *name : {"road", "moving road", "assembly", "moving assembly", "copy"})
+        if (reporter.Time(name) > 0)
+            std::printf("  %-16s %.2f\n", name, reporter.Time(name) / floor);
+}
+
+// ---- The interleaved run: one iteration of each probe in turn ----------------
+
+// User-space instructions of this thread, where the kernel lets us count them.
+class InstructionCounter {
+public:
+    InstructionCounter()
+    {
+        perf_event_attr attr{};
+        attr.type = PERF_TYPE_HARDWARE;
+        attr.size = sizeof attr;
+        attr.config = PERF_COUNT_HW_INSTRUCTIONS;
+        attr.exclude_kernel = 1;
+        attr.exclude_hv = 1;
+        fd_ = static_cast<int>(syscall(SYS_perf_event_open, &attr, 0, -1, -1, 0));
+    }
+    ~InstructionCounter()
+    {
+        if (fd_ >= 0)
+            close(fd_);
+    }
+    bool Available() const { return fd_ >= 0; }
+    long long Read() const
+    {
+        long long count = 0;
+        if (fd_ < 0 || read(fd_, &count, sizeof count) != static_cast<ssize_t>(sizeof count))
+            return 0;
+        return count;
+    }
+
+private:
+    int fd_ = -1;
+};
+
+enum Probe { kFloor, kRoad, kMovingRoad, kAssembly, kMovingAssembly, kPlatformProbe, kProbeCount };
+const char *const kProbeNames[kProbeCount] = {"floor",    "road",            "moving road",
+                                              "assembly", "moving assembly", "platform"};
+
+double Median(std::vector<double> values)
+{
+    if (values.empty())
+        return 0;
+    std::nth_element(values.begin(), values.begin() + values.size() / 2, values.end());
+    return values[values.size() / 2];
+}
+
+// The cost of one timed platform call's bookkeeping, to take off the sums.
+double TimingOverheadNs()
+{
+    constexpr int kSamples = 100000;
+    const long long start = NowNs();
+    for (int i = 0; i < kSamples; ++i)
+        benchmark::DoNotOptimize(NowNs());
+    return static_cast<double>(NowNs() - start) / kSamples;
+}
+
+struct Interleaved {
+    double ns[kProbeCount] = {};            // medians
+    double instructions[kProbeCount] = {};  // medians; 0 where not counted
+    double platformCalls = 0;
+    double syscallNs = 0;  // part of ns[kPlatformProbe]: stat and readlink
+};
+
+Interleaved RunInterleaved(Probes &probes, int rounds)
+{
+    constexpr int kWarmUpRounds = 5;
+    InstructionCounter counter;
+    std::vector<double> ns[kProbeCount], instructions[kProbeCount], syscalls;
+    const double overhead = TimingOverheadNs();
+    Interleaved figures;
+    for (int round = -kWarmUpRounds; round < rounds; ++round) {
+        for (int probe = 0; probe < kProbeCount; ++probe) {
+            Json::Value reply;
+            if (probe == kMovingAssembly)
+                reply = probes.parsedReply;
+            PlatformClock &clock = tPlatform;
+            clock = PlatformClock{};
+            clock.on = probe == kPlatformProbe;
+            const long long startInstructions = counter.Read();
+            const long long start = NowNs();
+            bool ok = false;
+            switch (probe) {
+            case kFloor: ok = probes.Floor(); break;
+            case kRoad: ok = probes.Road(false); break;
+            case kMovingRoad: ok = probes.Road(true); break;
+            case kAssembly: ok = probes.Assembly(); break;
+            case kMovingAssembly: ok = probes.MovingAssembly(reply); break;
+            case kPlatformProbe: ok = probes.Road(true); break;
+            }
+            const long long elapsed = NowNs() - start;
+            const long long spent = counter.Read() - startInstructions;
+            clock.on = false;
+            if (!ok) {
+                std::fprintf(stderr, "benchmark: the %s probe failed\n", kProbeNames[probe]);
+                std::exit(1);
+            }
+            if (round < 0)
+                continue;
+            if (probe == kPlatformProbe) {
+                // Two clock readings per timed call belong to the bookkeeping.
+                const double bookkeeping = clock.calls * overhead;
+                ns[probe].push_back(clock.platformNs + clock.syscallNs - bookkeeping);
+                syscalls.push_back(clock.syscallNs);
+                figures.platformCalls = static_cast<double>(clock.calls);
+            } else {
+                ns[probe].push_back(static_cast<double>(elapsed));
+                if (counter.Available())
+                    instructions[probe].push_back(static_cast<double>(spent));
+            }
+        }
+    }
+    for (int probe = 0; probe < kProbeCount; ++probe) {
+        figures.ns[probe] = Median(ns[probe]);
+        figures.instructions[probe] = Median(instructions[probe]);
+    }
+    figures.syscallNs = Median(syscalls);
+    return figures;
+}
+
+// Peak memory of one whole-road call above what was live before it.
+long long RoadPeakBytes(Probes &probes, bool moving)
+{
+    probes.Road(moving);  // first-call allocations of the libraries stay out
+    const long long before = gLiveBytes.load();
+    gPeakBytes = before;
+    if (!probes.Road(moving)) {
+        std::fprintf(stderr, "benchmark: the whole road failed\n");
+        std::exit(1);
+    }
+    return gPeakBytes.load() - before;
+}
+
+std::string LoadAverage()
+{
+    double load = 0;
+    if (getloadavg(&load, 1) != 1)
+        return "unknown";
+    char text[32];
+    std::snprintf(text, sizeof text, "%.2f", load);
+    return text;
+}
+
+// Takes --interleaved=<rounds> out of the arguments; true when Google
+// Benchmark's own flags remain.
+bool TakeOptions(int &argc, char **argv, int &rounds)
+{
+    constexpr char kRoundsOption[] = "--interleaved=";
+    int kept = 1;
+    bool benchmarkFlags = false;
+    for (int i = 1; i < argc; ++i) {
+        if (std::strncmp(argv[i], kRoundsOption, sizeof kRoundsOption - 1) == 0) {
+            char *end = nullptr;
+            long value = std::strtol(argv[i] + sizeof kRoundsOption - 1, &end, 10);
+            if (*end != '\0' || value < 1 || value > 1000000) {
+                std::fprintf(stderr, "benchmark: %s: rounds must be 1 to 1000000\n", argv[i]);
+                std::exit(2);
+            }
+            rounds = static_cast<int>(value);
+            continue;
+        }
+        if (std::strncmp(argv[i], "--benchmark_", 12) != 0) {
+            std::fprintf(stderr,
+                         "usage: %s [--interleaved=<rounds>] [--benchmark_<flag>...]\n"
+                         "unknown argument: %s\n",
+                         argv[0], argv[i]);
+            std::exit(2);
+        }
+        benchmarkFlags = true;
+        argv[kept++] = argv[i];
+    }
+    argc = kept;
+    return benchmarkFlags;
+}
 
 }  // namespace
 
 int main(int argc, char **argv)
 {
+    constexpr int kDefaultRounds = 200;
+    int rounds = kDefaultRounds;
+    const bool googleBenchmark = TakeOptions(argc, argv, rounds);
+
     SpaceNodes nodes;
     const std::string reply = DescribeAppliance(nodes);
     Collector collector(reply);
-    Json::Reader().parse(reply, gParsedReply);
+    Probes probes(reply);
+    gProbes = &probes;
     std::printf("reply: %zu bytes; %zu spaces with block-device nodes\n", reply.size(),
                 nodes.paths.size());
 
-    // Peak memory of one whole-road call, above what was live before it.
-    {
-        const Json::Value request = Request();
-        long long before = gLiveBytes.load();
-        gPeakBytes = before;
-        {
-            Transmitor transmitor("localhost");
-            Json::Value parsed, result(Json::objectValue);
-            if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(parsed) != 0 ||
-                !SNMPParseReplyData(request, parsed, result)) {
-                std::fprintf(stderr, "the whole road failed\n");
-                return 1;
-            }
-        }
-        double ratio = static_cast<double>(gPeakBytes.load() - before) / reply.size();
-        std::printf("peak memory of one whole-road call: %lld bytes, %.2f x the reply (target <= 4)\n",
-                    gPeakBytes.load() - before, ratio);
+    double movingPeak = 0;
+    if (kCountsAllocations) {
+        const long long copying = RoadPeakBytes(probes, false);
+        const long long moving = RoadPeakBytes(probes, true);
+        movingPeak = static_cast<double>(moving) / reply.size();
+        std::printf("peak memory of one whole-road call (every malloc): copying %lld bytes "
+                    "(%.2f x the reply), moving %lld bytes (%.2f x)\n",
+                    copying, static_cast<double>(copying) / reply.size(), moving, movingPeak);
     }
 
-    benchmark::RegisterBenchmark("floor", Floor)->Unit(benchmark::kMicrosecond);
-    benchmark::RegisterBenchmark("road", Road)->Unit(benchmark::kMicrosecond);
-    benchmark::RegisterBenchmark("assembly", Assembly)->Unit(benchmark::kMicrosecond);
-    benchmark::RegisterBenchmark("copy", Copy)->Unit(benchmark::kMicrosecond);
-    benchmark::Initialize(&argc, argv);
-    RatioReporter reporter;
-    benchmark::RunSpecifiedBenchmarks(&reporter);
+    if (googleBenchmark)
+        RunGoogleBenchmark(argc, argv);
 
-    auto &ns = reporter.nanoseconds;
-    if (ns.count("floor") && ns.count("road") && ns.count("assembly")) {
-        std::printf("road/floor:     %.2f (target <= 1.3)\n", ns["road"] / ns["floor"]);
-        std::printf("assembly/floor: %.2f (target <= 0.25)\n", ns["assembly"] / ns["floor"]);
-        if (ns.count("copy"))
-            std::printf("copy/floor:     %.2f (the sections' deep copy alone)\n", ns["copy"] / ns["floor"]);
+    const Interleaved run = RunInterleaved(probes, rounds);
+    const double floor = run.ns[kFloor];
+    std::printf("interleaved run, %d rounds, medians per iteration:\n", rounds);
+    std::printf("  %-16s %10s %8s %14s %8s\n", "probe", "us", "/floor", "instructions", "/floor");
+    for (int probe = 0; probe < kProbeCount; ++probe) {
+        std::printf("  %-16s %10.1f %8.3f", kProbeNames[probe], run.ns[probe] / 1000,
+                    run.ns[probe] / floor);
+        if (run.instructions[probe] > 0)
+            std::printf(" %14.0f %8.3f", run.instructions[probe],
+                        run.instructions[probe] / run.instructions[kFloor]);
+        std::printf("\n");
     }
+    std::printf("  platform: %.0f calls per road; stat and readlink %.1f us of it\n",
+                run.platformCalls, run.syscallNs / 1000);
+
+    const double ownShare = (run.ns[kMovingRoad] - floor - run.ns[kPlatformProbe]) / floor;
+    std::printf("road/floor: %.3f\n", run.ns[kRoad] / floor);
+    std::printf("moving road/floor: %.3f\n", run.ns[kMovingRoad] / floor);
+    std::printf("own share/floor: %.3f\n", ownShare);
+    if (kCountsAllocations)
+        std::printf("moving peak/reply: %.2f\n", movingPeak);
+    else
+        std::printf("moving peak/reply: not counted (sanitizer build)\n");
+    std::printf("load average: %s\n", LoadAverage().c_str());
     korvstandin::Reset();
     return 0;
 }
