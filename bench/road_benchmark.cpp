@@ -911,6 +911,16 @@ int main(int argc, char **argv)
     gProbes = &probes;
     std::printf("reply: %zu bytes; %zu spaces with block-device nodes\n", reply.size(),
                 nodes.paths.size());
+    {
+        // Both forms of the assembly must agree on this appliance too.
+        Json::Value copied(Json::objectValue), moved(Json::objectValue);
+        Json::Value taken = probes.parsedReply;
+        if (!SNMPParseReplyData(probes.request, probes.parsedReply, copied) ||
+            !SNMPParseReplyData(probes.request, std::move(taken), moved) || !(copied == moved)) {
+            std::fprintf(stderr, "benchmark: the moving assembly differs from the copying one\n");
+            return 1;
+        }
+    }
 
     double movingPeak = 0;
     if (kCountsAllocations) {

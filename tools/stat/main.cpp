@@ -4,6 +4,7 @@
 
 #include <iostream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <json/writer.h>
@@ -58,7 +59,7 @@ int Statistics(const korvstat::Options &options)
     if (transmitor.GetDataJson(reply) != 0)
         return Fail("the collector's reply is not JSON");
     Json::Value result(Json::objectValue);
-    if (!SNMPParseReplyData(request, reply, result))
+    if (!SNMPParseReplyData(request, std::move(reply), result))
         return Fail("the collector's reply could not be assembled into statistics");
     Print(result, options.format);
     return 0;
