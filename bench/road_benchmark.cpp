@@ -588,17 +588,8 @@ struct Probes {
     }
 
     // Transmit + GetDataJson + SNMPParseReplyData, the reply copied or moved.
-    bool Road(bool moving)
-    {
-        Transmitor transmitor("localhost");
-        Json::Value reply, result(Json::objectValue);
-        if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(reply) != 0)
-            return false;
-        bool assembled = moving ? SNMPParseReplyData(request, std::move(reply), result)
-                                : SNMPParseReplyData(request, reply, result);
-        benchmark::DoNotOptimize(result);
-        return assembled;
-    }
+    // `peaks`, when given, gets the peak memory of each phase.
+    bool Road(bool moving, struct PhasePeaks *peaks = nullptr);
 
     bool Assembly()
     {
@@ -617,6 +608,47 @@ struct Probes {
         return assembled;
     }
 };
+
+// The peak memory of each phase of one road, above what was live before it.
+struct PhasePeaks {
+    enum Phase { kReceive, kParse, kAssemble, kRelease, kPhaseCount };
+    static constexpr const char *kNames[kPhaseCount] = {"receive", "parse", "assemble", "release"};
+    long long before = gLiveBytes.load();
+    long long peak[kPhaseCount] = {};
+
+    void End(Phase phase)
+    {
+        peak[phase] = gPeakBytes.load() - before;
+        gPeakBytes = gLiveBytes.load();
+    }
+};
+
+bool Probes::Road(bool moving, PhasePeaks *peaks)
+{
+    const auto end = [peaks](PhasePeaks::Phase phase) {
+        if (peaks != nullptr)
+            peaks->End(phase);
+    };
+    if (peaks != nullptr)
+        gPeakBytes = gLiveBytes.load();
+    bool assembled = false;
+    {
+        Transmitor transmitor("localhost");
+        Json::Value reply, result(Json::objectValue);
+        if (transmitor.Transmit(request) != 0)
+            return false;
+        end(PhasePeaks::kReceive);
+        if (transmitor.GetDataJson(reply) != 0)
+            return false;
+        end(PhasePeaks::kParse);
+        assembled = moving ? SNMPParseReplyData(request, std::move(reply), result)
+                           : SNMPParseReplyData(request, reply, result);
+        benchmark::DoNotOptimize(result);
+        end(PhasePeaks::kAssemble);
+    }
+    end(PhasePeaks::kRelease);
+    return assembled;
+}
 
 Probes *gProbes = nullptr;
 
@@ -841,17 +873,16 @@ Interleaved RunInterleaved(Probes &probes, int rounds)
     return figures;
 }
 
-// Peak memory of one whole-road call above what was live before it.
-long long RoadPeakBytes(Probes &probes, bool moving)
+// Peak memory of one whole-road call above what was live before it, per phase.
+PhasePeaks RoadPeaks(Probes &probes, bool moving)
 {
     probes.Road(moving);  // first-call allocations of the libraries stay out
-    const long long before = gLiveBytes.load();
-    gPeakBytes = before;
-    if (!probes.Road(moving)) {
+    PhasePeaks peaks;
+    if (!probes.Road(moving, &peaks)) {
         std::fprintf(stderr, "benchmark: the whole road failed\n");
         std::exit(1);
     }
-    return gPeakBytes.load() - before;
+    return peaks;
 }
 
 std::string LoadAverage()
@@ -924,12 +955,18 @@ int main(int argc, char **argv)
 
     double movingPeak = 0;
     if (kCountsAllocations) {
-        const long long copying = RoadPeakBytes(probes, false);
-        const long long moving = RoadPeakBytes(probes, true);
-        movingPeak = static_cast<double>(moving) / reply.size();
-        std::printf("peak memory of one whole-road call (every malloc): copying %lld bytes "
-                    "(%.2f x the reply), moving %lld bytes (%.2f x)\n",
-                    copying, static_cast<double>(copying) / reply.size(), moving, movingPeak);
+        for (bool moving : {false, true}) {
+            const PhasePeaks peaks = RoadPeaks(probes, moving);
+            const long long peak = *std::max_element(peaks.peak, peaks.peak + PhasePeaks::kPhaseCount);
+            std::printf("peak memory of one %s road (every malloc): %lld bytes, %.2f x the reply;",
+                        moving ? "moving" : "copying", peak, static_cast<double>(peak) / reply.size());
+            for (int phase = 0; phase < PhasePeaks::kPhaseCount; ++phase)
+                std::printf(" %s %.2f", PhasePeaks::kNames[phase],
+                            static_cast<double>(peaks.peak[phase]) / reply.size());
+            std::printf("\n");
+            if (moving)
+                movingPeak = static_cast<double>(peak) / reply.size();
+        }
     }
 
     if (googleBenchmark)
