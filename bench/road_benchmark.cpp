@@ -39,8 +39,10 @@
 #include <cstring>
 #include <ctime>
 #include <filesystem>
+#include <fstream>
 #include <map>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <vector>
 
@@ -810,6 +812,32 @@ double TimingOverheadNs()
     return static_cast<double>(NowNs() - start) / kSamples;
 }
 
+// One iteration of `probe`; `reply` is the moving assembly's copy of the reply.
+void RunProbe(Probes &probes, int probe, Json::Value &reply)
+{
+    bool ok = false;
+    switch (probe) {
+    case kFloor: ok = probes.Floor(); break;
+    case kRoad: ok = probes.Road(false); break;
+    case kMovingRoad: ok = probes.Road(true); break;
+    case kAssembly: ok = probes.Assembly(); break;
+    case kMovingAssembly: ok = probes.MovingAssembly(reply); break;
+    case kPlatformProbe: ok = probes.Road(true); break;
+    }
+    if (!ok) {
+        std::fprintf(stderr, "benchmark: the %s probe failed\n", kProbeNames[probe]);
+        std::exit(1);
+    }
+}
+
+void RunProbe(Probes &probes, int probe)
+{
+    Json::Value reply;
+    if (probe == kMovingAssembly)
+        reply = probes.parsedReply;
+    RunProbe(probes, probe, reply);
+}
+
 struct Interleaved {
     double ns[kProbeCount] = {};            // medians
     double instructions[kProbeCount] = {};  // medians; 0 where not counted
@@ -834,22 +862,10 @@ Interleaved RunInterleaved(Probes &probes, int rounds)
             clock.on = probe == kPlatformProbe;
             const long long startInstructions = counter.Read();
             const long long start = NowNs();
-            bool ok = false;
-            switch (probe) {
-            case kFloor: ok = probes.Floor(); break;
-            case kRoad: ok = probes.Road(false); break;
-            case kMovingRoad: ok = probes.Road(true); break;
-            case kAssembly: ok = probes.Assembly(); break;
-            case kMovingAssembly: ok = probes.MovingAssembly(reply); break;
-            case kPlatformProbe: ok = probes.Road(true); break;
-            }
+            RunProbe(probes, probe, reply);
             const long long elapsed = NowNs() - start;
             const long long spent = counter.Read() - startInstructions;
             clock.on = false;
-            if (!ok) {
-                std::fprintf(stderr, "benchmark: the %s probe failed\n", kProbeNames[probe]);
-                std::exit(1);
-            }
             if (round < 0)
                 continue;
             if (probe == kPlatformProbe) {
@@ -895,48 +911,71 @@ std::string LoadAverage()
     return text;
 }
 
-// Takes --interleaved=<rounds> out of the arguments; true when Google
-// Benchmark's own flags remain.
-bool TakeOptions(int &argc, char **argv, int &rounds)
+struct Options {
+    int rounds = 200;
+    int onlyProbe = -1;       // --only: run this probe alone (for profilers)
+    std::string replyPath;    // --write-reply: save the reply text there and stop
+    bool googleBenchmark = false;  // Google Benchmark's flags were given
+};
+
+[[noreturn]] void Usage(const char *program, const char *argument)
 {
-    constexpr char kRoundsOption[] = "--interleaved=";
+    std::fprintf(stderr,
+                 "usage: %s [--interleaved=<rounds>] [--only=<probe>] [--write-reply=<path>] "
+                 "[--benchmark_<flag>...]\nbad argument: %s\n",
+                 program, argument);
+    std::exit(2);
+}
+
+// Takes this program's options out of the arguments, leaving Google
+// Benchmark's flags.
+Options TakeOptions(int &argc, char **argv)
+{
+    const std::string_view kRounds = "--interleaved=", kOnly = "--only=", kReply = "--write-reply=";
+    Options options;
     int kept = 1;
-    bool benchmarkFlags = false;
     for (int i = 1; i < argc; ++i) {
-        if (std::strncmp(argv[i], kRoundsOption, sizeof kRoundsOption - 1) == 0) {
+        const std::string_view argument = argv[i];
+        const auto value = [&](std::string_view option) { return argv[i] + option.size(); };
+        if (argument.substr(0, kRounds.size()) == kRounds) {
             char *end = nullptr;
-            long value = std::strtol(argv[i] + sizeof kRoundsOption - 1, &end, 10);
-            if (*end != '\0' || value < 1 || value > 1000000) {
-                std::fprintf(stderr, "benchmark: %s: rounds must be 1 to 1000000\n", argv[i]);
-                std::exit(2);
-            }
-            rounds = static_cast<int>(value);
-            continue;
+            long rounds = std::strtol(value(kRounds), &end, 10);
+            if (*end != '\0' || rounds < 1 || rounds > 1000000)
+                Usage(argv[0], argv[i]);
+            options.rounds = static_cast<int>(rounds);
+        } else if (argument.substr(0, kOnly.size()) == kOnly) {
+            const auto named = std::find_if(std::begin(kProbeNames), std::end(kProbeNames),
+                                            [&](const char *name) { return value(kOnly) == std::string_view(name); });
+            if (named == std::end(kProbeNames))
+                Usage(argv[0], argv[i]);
+            options.onlyProbe = static_cast<int>(named - std::begin(kProbeNames));
+        } else if (argument.substr(0, kReply.size()) == kReply && *value(kReply) != '\0') {
+            options.replyPath = value(kReply);
+        } else if (argument.substr(0, 12) == "--benchmark_") {
+            options.googleBenchmark = true;
+            argv[kept++] = argv[i];
+        } else {
+            Usage(argv[0], argv[i]);
         }
-        if (std::strncmp(argv[i], "--benchmark_", 12) != 0) {
-            std::fprintf(stderr,
-                         "usage: %s [--interleaved=<rounds>] [--benchmark_<flag>...]\n"
-                         "unknown argument: %s\n",
-                         argv[0], argv[i]);
-            std::exit(2);
-        }
-        benchmarkFlags = true;
-        argv[kept++] = argv[i];
     }
     argc = kept;
-    return benchmarkFlags;
+    return options;
 }
 
 }  // namespace
 
 int main(int argc, char **argv)
 {
-    constexpr int kDefaultRounds = 200;
-    int rounds = kDefaultRounds;
-    const bool googleBenchmark = TakeOptions(argc, argv, rounds);
+    const Options options = TakeOptions(argc, argv);
+    const int rounds = options.rounds;
 
     SpaceNodes nodes;
     const std::string reply = DescribeAppliance(nodes);
+    if (!options.replyPath.empty()) {
+        std::ofstream(options.replyPath) << reply;
+        korvstandin::Reset();
+        return 0;
+    }
     Collector collector(reply);
     Probes probes(reply);
     gProbes = &probes;
@@ -969,8 +1008,16 @@ int main(int argc, char **argv)
         }
     }
 
-    if (googleBenchmark)
+    if (options.googleBenchmark)
         RunGoogleBenchmark(argc, argv);
+
+    if (options.onlyProbe >= 0) {
+        for (int round = 0; round < rounds; ++round)
+            RunProbe(probes, options.onlyProbe);
+        std::printf("ran the %s probe %d times\n", kProbeNames[options.onlyProbe], rounds);
+        korvstandin::Reset();
+        return 0;
+    }
 
     const Interleaved run = RunInterleaved(probes, rounds);
     const double floor = run.ns[kFloor];
