@@ -53,6 +53,7 @@
 #include "korv_standin.h"
 #include "korv_webapi.h"
 #include "korvsnmp/korvsnmp.h"
+#include "protocol/collector_protocol.h"
 
 // ---- Allocation accounting at malloc, for the peak memory of one call -----
 //
@@ -312,7 +313,7 @@ extern "C" void __syslog_chk(int priority, int, const char *format, ...)
 
 namespace {
 
-constexpr char kSocketPath[] = "/tmp/korvsnmpcd.sock";
+using korvproto::kCollectorSocketPath;
 constexpr int kInternalDisks = 24;
 constexpr int kExpansionUnits = 5;
 constexpr int kDisksPerUnit = 8;
@@ -465,19 +466,17 @@ class Collector {
 public:
     explicit Collector(const std::string &reply) : request_(kRequestBufferSize)
     {
-        unlink(kSocketPath);
+        unlink(kCollectorSocketPath);
         listenFd_ = socket(AF_UNIX, SOCK_STREAM, 0);
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, kSocketPath);
+        std::strcpy(address.sun_path, kCollectorSocketPath);
         if (bind(listenFd_, reinterpret_cast<sockaddr *>(&address), sizeof address) != 0 ||
             listen(listenFd_, 16) != 0) {
             std::perror("benchmark collector");
             std::exit(1);
         }
-        uint32_t length = htonl(static_cast<uint32_t>(reply.size()));
-        frame_.assign(reinterpret_cast<char *>(&length), sizeof length);
-        frame_ += reply;
+        frame_ = korvproto::EncodeFrame(reply);
         server_ = std::thread([this] { Serve(); });
         while (!serving_.load())
             std::this_thread::yield();
@@ -488,7 +487,7 @@ public:
         close(Connect());  // wakes the accept
         server_.join();
         close(listenFd_);
-        unlink(kSocketPath);
+        unlink(kCollectorSocketPath);
     }
 
     static int Connect()
@@ -496,7 +495,7 @@ public:
         int fd = socket(AF_UNIX, SOCK_STREAM, 0);
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, kSocketPath);
+        std::strcpy(address.sun_path, kCollectorSocketPath);
         connect(fd, reinterpret_cast<sockaddr *>(&address), sizeof address);
         return fd;
     }
@@ -507,10 +506,10 @@ private:
     // Reads one whole request frame: its length, then that many bytes.
     bool ReadRequest(int fd)
     {
-        uint32_t length = 0;
-        if (read(fd, &length, sizeof length) != static_cast<ssize_t>(sizeof length))
+        char prefix[korvproto::kFramePrefixBytes];
+        if (read(fd, prefix, sizeof prefix) != static_cast<ssize_t>(sizeof prefix))
             return false;
-        size_t missing = ntohl(length);
+        size_t missing = korvproto::DecodeFramePrefix(prefix);
         while (missing > 0) {
             ssize_t n = read(fd, request_.data(), std::min(missing, request_.size()));
             if (n <= 0)
@@ -561,13 +560,8 @@ struct Probes {
     std::vector<char> piece = std::vector<char>(65536);
     Json::Value parsedReply;
 
-    explicit Probes(const std::string &reply)
+    explicit Probes(const std::string &reply) : requestFrame(korvproto::EncodeRequestFrame(request))
     {
-        const std::string text = Json::FastWriter().write(request);
-        requestFrame.assign(4, '\0');
-        uint32_t length = htonl(static_cast<uint32_t>(text.size() + 1));
-        std::memcpy(requestFrame.data(), &length, 4);
-        requestFrame.append(text.c_str(), text.size() + 1);
         Json::Reader().parse(reply, parsedReply);
     }
 
@@ -582,8 +576,8 @@ struct Probes {
             received.append(piece.data(), static_cast<size_t>(n));
         close(fd);
         Json::Value reply;
-        bool parsed = received.size() > 4 &&
-                      Json::Reader().parse(received.data() + 4, received.data() + received.size(),
+        bool parsed = received.size() > korvproto::kFramePrefixBytes &&
+                      Json::Reader().parse(received.data() + korvproto::kFramePrefixBytes, received.data() + received.size(),
                                            reply, true);
         benchmark::DoNotOptimize(reply);
         return sent && parsed;

@@ -15,7 +15,7 @@
 #include "json_take.h"
 #include "korv_platform.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

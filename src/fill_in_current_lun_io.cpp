@@ -10,7 +10,7 @@
 #include <korv_webapi.h>
 
 #include "json_read.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

@@ -6,7 +6,7 @@
 #include <korv_core.h>
 
 #include "json_read.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

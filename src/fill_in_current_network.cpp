@@ -12,7 +12,7 @@
 #include "korv_core.h"
 #include "korv_net.h"
 #include "korvsnmp/fill_in_current_network.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

@@ -21,7 +21,7 @@
 
 #include "json_read.h"
 #include "json_take.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

@@ -12,7 +12,7 @@
 #include "korvsnmp/fill_in_current_space_io.h"
 #include "korvsnmp/parse_data.h"
 #include "json_take.h"
-#include "log.h"
+#include "protocol/unit_log.h"
 
 namespace {
 

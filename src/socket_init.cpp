@@ -1,17 +1,18 @@
 // Opening a connection to the collector daemon.
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <unistd.h>
 
 #include <cstring>
 
 #include "korvsnmp/transmitor.h"
-#include "log.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unique_fd.h"
+#include "protocol/unit_log.h"
 
 namespace {
 
 constexpr char kLogUnit[] = "socket_init";
-constexpr char kCollectorSocketPath[] = "/tmp/korvsnmpcd.sock";
+using korvproto::kCollectorSocketPath;
 
 static_assert(sizeof kCollectorSocketPath <= sizeof(sockaddr_un::sun_path),
               "the socket path fits the address");
@@ -20,8 +21,8 @@ static_assert(sizeof kCollectorSocketPath <= sizeof(sockaddr_un::sun_path),
 
 int SocketInit()
 {
-    int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-    if (fd < 0) {
+    korvproto::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM, 0));
+    if (!fd.Valid()) {
         KORVSNMP_LOG(LOG_INFO, "Failed to create socket session, reason: [%m]");
         return -1;
     }
@@ -31,12 +32,11 @@ int SocketInit()
     address.sun_family = AF_UNIX;
     std::memcpy(address.sun_path, kCollectorSocketPath, sizeof kCollectorSocketPath);
 
-    if (connect(fd, reinterpret_cast<const sockaddr *>(&address), sizeof address) < 0) {
-        // Log before close(), which may change errno.
+    if (connect(fd.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) < 0) {
+        // Logged while the descriptor is still open: its close may change errno.
         KORVSNMP_LOG(LOG_INFO, "Failed to connect to socket: [%s], reason: [%m]",
                      kCollectorSocketPath);
-        close(fd);
         return -1;
     }
-    return fd;
+    return fd.Release();
 }

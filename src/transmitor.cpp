@@ -1,18 +1,18 @@
 // The collector client object: request and reply frames, whole exchanges,
 // and the collector control requests.
-#include <arpa/inet.h>
 #include <sys/select.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <cstdint>
-#include <cstring>
+#include <utility>
 
 #include <json/reader.h>
-#include <json/writer.h>
 
 #include "korvsnmp/transmitor.h"
-#include "log.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unique_fd.h"
+#include "protocol/unit_log.h"
 
 namespace {
 
@@ -20,45 +20,71 @@ constexpr char kLogUnit[] = "transmitor";
 
 constexpr timeval kWritableWait = {10, 500000};
 constexpr timeval kReadableWait = {90, 0};
-constexpr size_t kLengthPrefixSize = 4;
+constexpr size_t kLengthPrefixSize = korvproto::kFramePrefixBytes;
 constexpr size_t kReplyReadSize = 1024;
 
 constexpr char kControlHostName[] = "localhost";
 
-// Closes the connection that `fd` holds, if any, and marks it closed.
-void CloseConnection(int &fd)
-{
-    if (fd != -1) {
-        close(fd);
-        fd = -1;
+// Closes the connection that `fd` holds, if any, and marks it closed: the
+// one place where the object's descriptor is closed.
+void CloseConnection(int &fd) { korvproto::UniqueFd(std::exchange(fd, -1)); }
+
+// Closes the connection in `fd` when the scope ends, whether by return or by
+// an exception, unless KeepOpen() was called.
+class ConnectionScope {
+public:
+    explicit ConnectionScope(int &fd) : fd_(fd) {}
+    ~ConnectionScope()
+    {
+        if (!keepOpen_)
+            CloseConnection(fd_);
     }
-}
+    ConnectionScope(const ConnectionScope &) = delete;
+    ConnectionScope &operator=(const ConnectionScope &) = delete;
 
-// select() watches descriptors below FD_SETSIZE only: FD_SET on a higher one
-// would write past the set.
-bool FitsSelect(int fd)
+    void KeepOpen() { keepOpen_ = true; }
+
+private:
+    int &fd_;
+    bool keepOpen_ = false;
+};
+
+enum class Direction { Send, Receive };
+
+// The wait before a frame moves: at most 10.5 s for writability before
+// sending, 90 s for readability before receiving. True when the caller may go
+// on; otherwise the reason is logged, except a silent collector's.
+bool WaitUntilReady(int fd, Direction direction)
 {
-    if (fd < FD_SETSIZE)
-        return true;
-    KORVSNMP_LOG(LOG_ERR, "socket descriptor %d is beyond select()'s limit of %d", fd,
-                 FD_SETSIZE);
-    return false;
-}
-
-enum class Readiness { Readable, Writable };
-
-// Waits at most `wait` for `fd` (0 <= fd < FD_SETSIZE) to become ready.
-// Returns select()'s result; `marked` tells whether `fd` came back marked.
-int WaitFor(int fd, Readiness readiness, timeval wait, bool &marked)
-{
+    if (fd < 0) {
+        KORVSNMP_LOG(LOG_ERR, "Bad parameter");
+        return false;
+    }
+    // select() watches descriptors below FD_SETSIZE only: FD_SET on a higher
+    // one would write past the set.
+    if (fd >= FD_SETSIZE) {
+        KORVSNMP_LOG(LOG_ERR, "socket descriptor %d is beyond select()'s limit of %d", fd,
+                     FD_SETSIZE);
+        return false;
+    }
+    const bool sending = direction == Direction::Send;
+    timeval wait = sending ? kWritableWait : kReadableWait;
     fd_set set;
     FD_ZERO(&set);
     FD_SET(fd, &set);
-    fd_set *readSet = readiness == Readiness::Readable ? &set : nullptr;
-    fd_set *writeSet = readiness == Readiness::Writable ? &set : nullptr;
-    int result = select(fd + 1, readSet, writeSet, nullptr, &wait);
-    marked = result > 0 && FD_ISSET(fd, &set);
-    return result;
+    const int result =
+        select(fd + 1, sending ? nullptr : &set, sending ? &set : nullptr, nullptr, &wait);
+    if (result < 0 || (result == 0 && sending)) {
+        KORVSNMP_LOG(LOG_ERR, "select() failed. ret=[%d]", result);
+        return false;
+    }
+    if (result == 0)  // the collector kept silent for the whole wait
+        return false;
+    if (sending && !FD_ISSET(fd, &set)) {
+        KORVSNMP_LOG(LOG_ERR, "socket is unwritable");
+        return false;
+    }
+    return true;
 }
 
 // Writes all `size` bytes with one call. The collector may have gone away:
@@ -66,15 +92,6 @@ int WaitFor(int fd, Readiness readiness, timeval wait, bool &marked)
 bool SendWhole(int fd, const void *data, size_t size)
 {
     return send(fd, data, size, MSG_NOSIGNAL) == static_cast<ssize_t>(size);
-}
-
-// A one-line rendering of a value, for log messages.
-std::string ToText(const Json::Value &value)
-{
-    std::string text = Json::FastWriter().write(value);
-    if (!text.empty() && text.back() == '\n')
-        text.pop_back();
-    return text;
 }
 
 bool IsSuccessReply(const Json::Value &reply)
@@ -93,18 +110,18 @@ bool SendControlRequest(const Json::Value &request)
 
     if (transmitor.Transmit(request) == -1) {
         KORVSNMP_LOG(LOG_ERR, "Failed to send request to korvsnmpcd, request: [%s]",
-                     ToText(request).c_str());
+                     korvproto::CompactJson(request).c_str());
         return false;
     }
     if (transmitor.GetDataJson(reply) == -1) {
         KORVSNMP_LOG(LOG_ERR, "Failed to get response from korvsnmpcd, request: [%s]",
-                     ToText(request).c_str());
+                     korvproto::CompactJson(request).c_str());
         return false;
     }
     if (IsSuccessReply(reply))
         return true;
-    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]", ToText(request).c_str(),
-                 ToText(reply).c_str());
+    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]", korvproto::CompactJson(request).c_str(),
+                 korvproto::CompactJson(reply).c_str());
     return false;
 }
 
@@ -126,29 +143,23 @@ int Transmitor::SetHostName(const std::string &name)
 
 int Transmitor::Transmit(const Json::Value &request)
 {
+    CloseConnection(socketFd);  // never leak a connection that a caller left open
+    const ConnectionScope connection(socketFd);  // closed on every way out
     if (hostName.empty()) {
         KORVSNMP_LOG(LOG_ERR, "wrong parameter");
-        CloseConnection(socketFd);
         return -1;
     }
-
-    CloseConnection(socketFd);  // never leak a connection that a caller left open
     socketFd = SocketInit();
-    if (socketFd < 0) {
-        socketFd = -1;
+    if (socketFd < 0)
         return -1;
-    }
     if (TransmitData(request) < 0) {
         KORVSNMP_LOG(LOG_ERR, "Error: cannot transmit the data");
-        CloseConnection(socketFd);
         return -1;
     }
     if (ReceiveData() < 0) {
         KORVSNMP_LOG(LOG_ERR, "Error: cannot received the data");
-        CloseConnection(socketFd);
         return -1;
     }
-    CloseConnection(socketFd);
     return 0;
 }
 
@@ -184,93 +195,51 @@ int Transmitor::GetDataJson(Json::Value &value) const
 
 int Transmitor::TransmitData(const Json::Value &request)
 {
-    if (socketFd < 0) {
-        KORVSNMP_LOG(LOG_ERR, "Bad parameter");
+    ConnectionScope connection(socketFd);
+    if (!WaitUntilReady(socketFd, Direction::Send))
         return -1;
-    }
-    if (!FitsSelect(socketFd)) {
-        CloseConnection(socketFd);
-        return -1;
-    }
-
-    bool writable = false;
-    int ready = WaitFor(socketFd, Readiness::Writable, kWritableWait, writable);
-    if (ready <= 0) {
-        KORVSNMP_LOG(LOG_ERR, "select() failed. ret=[%d]", ready);
-        CloseConnection(socketFd);
-        return -1;
-    }
-    if (!writable) {
-        KORVSNMP_LOG(LOG_ERR, "socket is unwritable");
-        CloseConnection(socketFd);
-        return -1;
-    }
-
-    // The frame carries the text and its NUL; the writer's line feed is part of the text.
-    const std::string text = Json::FastWriter().write(request);
-    const uint32_t frameLength = static_cast<uint32_t>(std::strlen(text.c_str()) + 1);
-    const uint32_t prefix = htonl(frameLength);
-    if (!SendWhole(socketFd, &prefix, kLengthPrefixSize) ||
-        !SendWhole(socketFd, text.c_str(), frameLength)) {
+    // The prefix and the text (with its NUL) go out in one call each.
+    const std::string frame = korvproto::EncodeRequestFrame(request);
+    if (!SendWhole(socketFd, frame.data(), kLengthPrefixSize) ||
+        !SendWhole(socketFd, frame.data() + kLengthPrefixSize, frame.size() - kLengthPrefixSize)) {
         KORVSNMP_LOG(LOG_ERR, "Failed to send command.");
-        CloseConnection(socketFd);
         return -1;
     }
+    connection.KeepOpen();
     return 0;
 }
 
 int Transmitor::ReceiveData()
 {
-    if (socketFd < 0) {
-        KORVSNMP_LOG(LOG_ERR, "Bad parameter");
+    ConnectionScope connection(socketFd);
+    if (!WaitUntilReady(socketFd, Direction::Receive))
         return -1;
-    }
-    if (!FitsSelect(socketFd)) {
-        CloseConnection(socketFd);
-        return -1;
-    }
-
-    bool readable = false;
-    int ready = WaitFor(socketFd, Readiness::Readable, kReadableWait, readable);
-    if (ready < 0) {
-        KORVSNMP_LOG(LOG_ERR, "select() failed. ret=[%d]", ready);
-        CloseConnection(socketFd);
-        return -1;
-    }
-    if (ready == 0) {  // the collector kept silent for the whole wait
-        CloseConnection(socketFd);
-        return -1;
-    }
 
     dataStr.clear();
     unsigned char prefix[kLengthPrefixSize];
     if (read(socketFd, prefix, sizeof prefix) != static_cast<ssize_t>(sizeof prefix)) {
         KORVSNMP_LOG(LOG_ERR, "client Failed to read action");
-        CloseConnection(socketFd);
         return -1;
     }
-    uint32_t networkLength;
-    std::memcpy(&networkLength, prefix, sizeof networkLength);
-    const int32_t length = static_cast<int32_t>(ntohl(networkLength));
-    if (length <= 0)  // no body
-        return 0;
+    const int32_t length = static_cast<int32_t>(korvproto::DecodeFramePrefix(prefix));
 
     // Every read asks for a whole piece: bytes that arrive beyond the length
-    // in the same burst are kept too.
+    // in the same burst are kept too. The body is gathered apart, so that a
+    // failure never leaves half a reply behind.
+    std::string body;
     char piece[kReplyReadSize];
-    int64_t missing = length;
-    while (missing > 0) {
-        ssize_t received = read(socketFd, piece, sizeof piece);
+    for (int64_t missing = length; missing > 0;) {
+        const ssize_t received = read(socketFd, piece, sizeof piece);
         if (received <= 0) {
             KORVSNMP_LOG(LOG_ERR, "client Failed to read the reply body, %lld of %d bytes missing",
                          static_cast<long long>(missing), length);
-            dataStr.clear();  // never hand out half a reply
-            CloseConnection(socketFd);
             return -1;
         }
-        dataStr.append(piece, static_cast<size_t>(received));
+        body.append(piece, static_cast<size_t>(received));
         missing -= received;
     }
+    dataStr = std::move(body);
+    connection.KeepOpen();
     return 0;
 }
 

@@ -1,13 +1,28 @@
 // The collector control requests: their exact frames and the verdict on
 // every shape of reply.
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <sys/wait.h>
 #include <syslog.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <memory>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "korvsnmp/transmitor.h"
+#include "connect_redirect.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unique_fd.h"
 #include "syslog_capture.h"
 #include "test_collector.h"
+
+extern char **environ;
 
 namespace {
 
@@ -140,6 +155,75 @@ TEST_F(ControlRequestTest, CollectorHangingUpIsASendFailure)
                             Logged(LOG_ERR, kUnit, "Error: cannot received the data"),
                             Logged(LOG_ERR, kUnit,
                                    "Failed to send request to korvsnmpcd, request: [" + kReloadText + "]")));
+}
+
+sockaddr_un RealCollectorAddress()
+{
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::strcpy(address.sun_path, korvproto::kCollectorSocketPath);
+    return address;
+}
+
+bool RealCollectorAnswers()
+{
+    korvproto::UniqueFd probe(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const sockaddr_un address = RealCollectorAddress();
+    return korvtest_connect_unredirected(probe.Get(), reinterpret_cast<const sockaddr *>(&address),
+                                         sizeof address) == 0;
+}
+
+// Runs this test program's exchange tests (korvsnmp-stat's included) in a
+// child; its exit status.
+int RunExchangeTests()
+{
+    std::string self = "/proc/self/exe";
+    std::string filter =
+        "--gtest_filter=Transmitor*:ControlRequestTest.*:KorvsnmpStatProgram.*:WholeRoad*";
+    char *argv[] = {self.data(), filter.data(), nullptr};
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
+    pid_t child = -1;
+    int spawned = posix_spawn(&child, argv[0], &actions, nullptr, argv, environ);
+    posix_spawn_file_actions_destroy(&actions);
+    int status = 0;
+    if (spawned != 0 || waitpid(child, &status, 0) != child)
+        return -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+// A collector on the real socket path, ours or a live one, is neither
+// removed nor cut off by the tests that exchange with a test collector.
+TEST(RealCollectorSocket, ExchangeTestsLeaveItInPlaceAndAnswering)
+{
+    const char *path = korvproto::kCollectorSocketPath;
+    korvproto::UniqueFd ours;
+    struct stat before;
+    // Our own listener's file goes with the test, if it is still ours.
+    auto removeOurs = [&](void *) {
+        struct stat now;
+        if (ours.Valid() && lstat(path, &now) == 0 && now.st_ino == before.st_ino)
+            unlink(path);
+    };
+    std::unique_ptr<void, decltype(removeOurs)> cleanup(&ours, removeOurs);
+    if (lstat(path, &before) == 0) {
+        if (!RealCollectorAnswers())
+            GTEST_SKIP() << path << " exists but nothing answers there; not touching it";
+    } else {
+        ours = korvproto::UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+        const sockaddr_un address = RealCollectorAddress();
+        ASSERT_EQ(bind(ours.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address), 0);
+        ASSERT_EQ(listen(ours.Get(), 64), 0);
+        ASSERT_EQ(lstat(path, &before), 0);
+    }
+
+    EXPECT_EQ(RunExchangeTests(), 0);
+
+    struct stat after;
+    ASSERT_EQ(lstat(path, &after), 0) << path << " was removed";
+    EXPECT_EQ(after.st_ino, before.st_ino) << path << " was replaced";
+    EXPECT_TRUE(RealCollectorAnswers());
 }
 
 }  // namespace

@@ -139,7 +139,7 @@ ProgramRun RunStat(const std::string &arguments)
     int errFd = mkstemp(pattern);
     close(errFd);
     const std::string command =
-        std::string(KORVSNMP_STAT_PATH) + " " + arguments + " 2>" + pattern;
+        korvtest::RedirectedChildPrefix() + KORVSNMP_STAT_PATH + " " + arguments + " 2>" + pattern;
     ProgramRun run{-1, "", ""};
     FILE *pipe = popen(command.c_str(), "r");
     if (pipe == nullptr)

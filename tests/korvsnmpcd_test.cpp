@@ -27,21 +27,21 @@
 #include <gtest/gtest.h>
 #include <json/json.h>
 
-#include "framing.h"
 #include "proc_parsers.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unique_fd.h"
 #include "rates.h"
 #include "reply.h"
 #include "syslog_capture.h"
-#include "unique_fd.h"
 
 extern char **environ;
 
 namespace {
 
 using korvsnmpcd::BlockCounters;
-using korvsnmpcd::RequestDecoder;
+using korvproto::RequestDecoder;
 using korvsnmpcd::Snapshot;
-using korvsnmpcd::UniqueFd;
+using korvproto::UniqueFd;
 using korvtest::Logged;
 using ::testing::Contains;
 using ::testing::ElementsAre;
@@ -365,16 +365,16 @@ TEST(KorvsnmpcdFraming, RequestGatheredFromAnyPieces)
     EXPECT_EQ(decoder.Feed(&frame[4 + body.size() - 1], 6), RequestDecoder::State::kComplete);
     EXPECT_EQ(decoder.Body(), body);
 
-    for (uint32_t refused : {0u, korvsnmpcd::kMaxRequestBytes + 1, 0xffffffffu}) {
+    for (uint32_t refused : {0u, korvproto::kMaxRequestBytes + 1, 0xffffffffu}) {
         RequestDecoder bad;
         std::string prefix = Prefix(refused);
         EXPECT_EQ(bad.Feed(prefix.data(), prefix.size()), RequestDecoder::State::kInvalid) << refused;
     }
     RequestDecoder largest;
-    std::string prefix = Prefix(korvsnmpcd::kMaxRequestBytes);
+    std::string prefix = Prefix(korvproto::kMaxRequestBytes);
     EXPECT_EQ(largest.Feed(prefix.data(), prefix.size()), RequestDecoder::State::kIncomplete);
 
-    EXPECT_EQ(korvsnmpcd::FrameReply("{\"success\":true}"), Prefix(16) + "{\"success\":true}");
+    EXPECT_EQ(korvproto::EncodeFrame("{\"success\":true}"), Prefix(16) + "{\"success\":true}");
 }
 
 // ---------------------------------------------------------------- the daemon
@@ -434,13 +434,6 @@ std::string ReadUntilClosed(int fd, bool &closed)
     return bytes;
 }
 
-// A request frame exactly as the library writes it.
-std::string RequestFrame(const Json::Value &request)
-{
-    std::string text = Json::FastWriter().write(request);
-    return Prefix(static_cast<uint32_t>(text.size() + 1)) + text + '\0';
-}
-
 Json::Value StatisticsRequest()
 {
     Json::Value request;
@@ -461,9 +454,7 @@ std::string Exchange(const std::string &path, const std::string &frame)
     EXPECT_GE(reply.size(), 4u);
     if (reply.size() < 4)
         return "";
-    uint32_t length = 0;
-    std::memcpy(&length, reply.data(), 4);
-    EXPECT_EQ(ntohl(length), reply.size() - 4);
+    EXPECT_EQ(korvproto::DecodeFramePrefix(reply.data()), reply.size() - 4);
     return reply.substr(4);
 }
 
@@ -477,7 +468,7 @@ Json::Value Parse(const std::string &text)
 
 bool Answers(const std::string &path)
 {
-    Json::Value reply = Parse(Exchange(path, RequestFrame(StatisticsRequest())));
+    Json::Value reply = Parse(Exchange(path, korvproto::EncodeRequestFrame(StatisticsRequest())));
     return reply.isObject() && reply["data"].isObject() && reply["data"]["Memory"].isArray();
 }
 
@@ -601,7 +592,7 @@ protected:
 
 TEST_F(KorvsnmpcdDaemon, StatisticsReplyHasEverySection)
 {
-    Json::Value reply = Parse(Exchange(path_, RequestFrame(StatisticsRequest())));
+    Json::Value reply = Parse(Exchange(path_, korvproto::EncodeRequestFrame(StatisticsRequest())));
     const Json::Value &data = reply["data"];
     ASSERT_TRUE(data.isObject()) << reply;
     EXPECT_EQ(data["System"].size(), 1u);
@@ -642,8 +633,8 @@ TEST_F(KorvsnmpcdDaemon, ControlRequestsSucceedAndLogTheReason)
     Json::Value history;
     history["request"] = "history_mode";
     history["reason"] = "nightly backup";
-    EXPECT_EQ(Exchange(path_, RequestFrame(reload)), "{\"success\":true}");
-    EXPECT_EQ(Exchange(path_, RequestFrame(history)), "{\"success\":true}");
+    EXPECT_EQ(Exchange(path_, korvproto::EncodeRequestFrame(reload)), "{\"success\":true}");
+    EXPECT_EQ(Exchange(path_, korvproto::EncodeRequestFrame(history)), "{\"success\":true}");
     EXPECT_THAT(daemon_.Log(), HasSubstr("History mode requested, reason: [nightly backup]"));
     EXPECT_THAT(daemon_.Log(), HasSubstr("Reload requested"));
 }
@@ -698,7 +689,7 @@ TEST_F(KorvsnmpcdDaemon, HundredsOfConnectionsInARowLeakNothing)
 {
     ASSERT_TRUE(Answers(path_));
     size_t descriptors = OpenDescriptors(daemon_.Pid());
-    const std::string frame = RequestFrame(StatisticsRequest());
+    const std::string frame = korvproto::EncodeRequestFrame(StatisticsRequest());
     for (int i = 0; i < 300; ++i)
         ASSERT_TRUE(Parse(Exchange(path_, frame))["data"].isObject()) << "exchange " << i;
     // Clients that leave without waiting for their reply.

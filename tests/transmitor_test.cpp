@@ -17,6 +17,7 @@
 #include "select_hook.h"
 #include "syslog_capture.h"
 #include "test_collector.h"
+#include "throwing_allocation.h"
 
 namespace {
 
@@ -470,6 +471,37 @@ TEST_F(TransmitorTest, NoDescriptorLeftIsAnInformationalSocketFailure)
     EXPECT_THAT(LoggedMessages(),
                 ElementsAre(Logged(LOG_INFO, "socket_init",
                                    "Failed to create socket session, reason: [Too many open files]")));
+}
+
+// Every allocation of a whole exchange fails in turn: the exception reaches
+// the caller, and the connection is closed all the same.
+TEST_F(TransmitorTest, AllocationFailureAnywhereLeavesNoConnection)
+{
+    korvtest::TestCollector collector;
+    Transmitor transmitor("host");
+    const int descriptors = korvtest::OpenDescriptorCount();
+    const Json::Value request = SampleRequest();
+    bool completed = false;
+    int failures = 0;
+    for (int nth = 1; !completed; ++nth) {
+        collector.Script({Frame(std::string(3000, 'x'))});
+        int result = -2;
+        {
+            korvtest::ThrowingAllocationFailure failure(nth);
+            try {
+                result = transmitor.Transmit(request);
+            } catch (const std::bad_alloc &) {
+                ++failures;
+            }
+            completed = !failure.Triggered();
+        }
+        ASSERT_TRUE(collector.WaitForConnections(static_cast<size_t>(nth))) << nth;
+        EXPECT_EQ(transmitor.socketFd, -1) << nth;
+        EXPECT_EQ(korvtest::OpenDescriptorCount(), descriptors) << nth;
+        EXPECT_EQ(result, completed ? 0 : -2) << nth;
+    }
+    EXPECT_GE(failures, 3);  // the request frame, the body and the reply text at least
+    EXPECT_EQ(transmitor.dataStr, std::string(3000, 'x'));
 }
 
 TEST_F(TransmitorTest, DestructorClosesAConnectionStillHeld)

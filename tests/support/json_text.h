@@ -7,7 +7,8 @@
 
 #include <gtest/gtest.h>
 #include <json/reader.h>
-#include <json/writer.h>
+
+#include "protocol/collector_protocol.h"
 
 namespace korvtest {
 
@@ -19,12 +20,7 @@ inline Json::Value ParseJson(const std::string &text)
 }
 
 // One line, object members in key order, numbers as written.
-inline std::string JsonText(const Json::Value &value)
-{
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    return Json::writeString(builder, value);
-}
+inline std::string JsonText(const Json::Value &value) { return korvproto::CompactJson(value); }
 
 // The compact text of a JSON literal, for comparison with JsonText.
 inline std::string Canonical(const std::string &text) { return JsonText(ParseJson(text)); }

@@ -1,10 +1,11 @@
 #include "test_collector.h"
 
-#include <arpa/inet.h>
+#include "connect_redirect.h"
+#include "protocol/collector_protocol.h"
+
 #include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
-#include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -17,7 +18,8 @@
 namespace korvtest {
 namespace {
 
-constexpr char kLockPath[] = "/tmp/korvsnmpcd.sock.test-lock";
+constexpr char kPrivateDirectoryPattern[] = "/tmp/korvtest-XXXXXX";
+constexpr char kPrivateSocketName[] = "/korvsnmpcd.sock";
 constexpr int kPeerWaitMs = 5000;  // a client that stalls longer has failed its test anyway
 
 [[noreturn]] void Die(const char *what)
@@ -49,40 +51,88 @@ bool ReadExactly(int fd, int stopFd, size_t count, std::string &into)
     return true;
 }
 
+std::string gPrivateDirectory;
+
+void RemovePrivateDirectory()
+{
+    unlink(PrivateCollectorPath().c_str());
+    rmdir(gPrivateDirectory.c_str());
+}
+
+std::string MakePrivatePath()
+{
+    char directory[] = "/tmp/korvtest-XXXXXX";
+    static_assert(sizeof directory == sizeof kPrivateDirectoryPattern);
+    if (mkdtemp(directory) == nullptr)
+        Die("making the private collector directory");
+    gPrivateDirectory = directory;
+    std::string path = gPrivateDirectory + kPrivateSocketName;
+    if (setenv(KORVTEST_COLLECTOR_SOCKET_VARIABLE, path.c_str(), 1) != 0)
+        Die("setting " KORVTEST_COLLECTOR_SOCKET_VARIABLE);
+    return path;
+}
+
+// Set up before any test runs, so that no connect() ever reaches the real path.
+const bool gRedirected = [] {
+    PrivateCollectorPath();
+    return std::atexit(RemovePrivateDirectory) == 0;
+}();
+
+std::string ShellQuoted(const std::string &word)
+{
+    std::string quoted = "'";
+    for (char c : word)
+        quoted += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    return quoted + "'";
+}
+
 }  // namespace
+
+const std::string &PrivateCollectorPath()
+{
+    static const std::string path = MakePrivatePath();
+    return path;
+}
+
+std::vector<std::string> RedirectedChildVariables()
+{
+    const char *sanitizer = getenv("ASAN_OPTIONS");
+    std::string asan = sanitizer != nullptr && *sanitizer != '\0' ? std::string(sanitizer) + ":" : "";
+    return {std::string("LD_PRELOAD=") + KORVTEST_REDIRECT_LIBRARY,
+            std::string(KORVTEST_COLLECTOR_SOCKET_VARIABLE "=") + PrivateCollectorPath(),
+            "ASAN_OPTIONS=" + asan + "verify_asan_link_order=0"};
+}
+
+std::string RedirectedChildPrefix()
+{
+    std::string prefix;
+    for (const std::string &variable : RedirectedChildVariables()) {
+        size_t equals = variable.find('=');
+        prefix += variable.substr(0, equals + 1) + ShellQuoted(variable.substr(equals + 1)) + " ";
+    }
+    return prefix;
+}
 
 std::string FrameClaiming(uint32_t length, std::string_view body)
 {
-    uint32_t prefix = htonl(length);
-    std::string frame(reinterpret_cast<const char *>(&prefix), sizeof prefix);
-    frame.append(body);
-    return frame;
+    return korvproto::EncodeFramePrefix(length).append(body);
 }
 
-std::string Frame(std::string_view body)
-{
-    return FrameClaiming(static_cast<uint32_t>(body.size()), body);
-}
+std::string Frame(std::string_view body) { return korvproto::EncodeFrame(body); }
 
-SocketPathLock::SocketPathLock() : lockFd_(open(kLockPath, O_RDWR | O_CREAT | O_CLOEXEC, 0666))
-{
-    if (lockFd_ < 0 || flock(lockFd_, LOCK_EX) != 0)
-        Die("locking the collector socket path");
-}
-
-SocketPathLock::~SocketPathLock() { close(lockFd_); }
-
-NoCollector::NoCollector() { unlink(kCollectorSocketPath); }
+NoCollector::NoCollector() { unlink(PrivateCollectorPath().c_str()); }
 
 TestCollector::TestCollector()
 {
-    unlink(kCollectorSocketPath);
+    unlink(PrivateCollectorPath().c_str());
     listenFd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
     if (listenFd_ < 0)
         Die("test collector socket");
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
-    std::strcpy(address.sun_path, kCollectorSocketPath);
+    if (PrivateCollectorPath().size() >= sizeof address.sun_path)
+        Die("the private collector path is too long");
+    std::strcpy(address.sun_path, PrivateCollectorPath().c_str());
     if (bind(listenFd_, reinterpret_cast<sockaddr *>(&address), sizeof address) != 0 ||
         listen(listenFd_, 16) != 0)
         Die("test collector bind/listen");
@@ -99,7 +149,7 @@ TestCollector::~TestCollector()
     close(listenFd_);
     close(stopPipe_[0]);
     close(stopPipe_[1]);
-    unlink(kCollectorSocketPath);
+    unlink(PrivateCollectorPath().c_str());
 }
 
 void TestCollector::Script(Answer answer)
@@ -147,11 +197,10 @@ void TestCollector::Handle(int connection, const Answer &answer)
     std::string received;
     if (answer.readRequest) {
         std::string prefix;
-        if (ReadExactly(connection, stopPipe_[0], 4, prefix)) {
-            uint32_t length;
-            std::memcpy(&length, prefix.data(), sizeof length);
+        if (ReadExactly(connection, stopPipe_[0], korvproto::kFramePrefixBytes, prefix)) {
             received = prefix;
-            ReadExactly(connection, stopPipe_[0], ntohl(length), received);
+            ReadExactly(connection, stopPipe_[0], korvproto::DecodeFramePrefix(prefix.data()),
+                        received);
         } else {
             received = prefix;
         }

@@ -1,10 +1,20 @@
-// A scripted collector daemon on "/tmp/korvsnmpcd.sock", for tests.
+// A scripted collector daemon for tests, and the seam that keeps tests off
+// the real collector's socket.
 //
-// It serves one connection at a time, on a thread of its own: it reads the
-// client's request frame, records the exact bytes, and answers with the next
-// scripted Answer. Every test that touches the fixed socket path holds the
-// path's test lock (an flock, so that test programs running at the same time
-// wait for each other too).
+// The seam: the test program replaces connect() (connect_redirect.c), so that
+// a connection to the collector's fixed path "/tmp/korvsnmpcd.sock" goes to a
+// private path of this process, PrivateCollectorPath(), in a directory of its
+// own; the program sets KORVTEST_COLLECTOR_SOCKET to it at start-up. Nothing
+// in a test program binds, removes or reaches the real path, so the tests run
+// beside a live collector and test programs run in parallel. A child process
+// that a test runs (korvsnmp-stat, the SNMP subagent) gets the same
+// redirection from the shim library libkorvtest_redirect.so: run it with
+// RedirectedChildVariables() in its environment (or RedirectedChildPrefix()
+// before a shell command).
+//
+// The collector serves one connection at a time, on a thread of its own: it
+// reads the client's request frame, records the exact bytes, and answers with
+// the next scripted Answer.
 #ifndef KORVTEST_TEST_COLLECTOR_H
 #define KORVTEST_TEST_COLLECTOR_H
 
@@ -19,7 +29,15 @@
 
 namespace korvtest {
 
-inline constexpr char kCollectorSocketPath[] = "/tmp/korvsnmpcd.sock";
+// Where this process's connections to the fixed path go; made at start-up.
+const std::string &PrivateCollectorPath();
+
+// "LD_PRELOAD=<shim>", "KORVTEST_COLLECTOR_SOCKET=<private path>" and
+// "ASAN_OPTIONS=<as ours>:verify_asan_link_order=0" (the shim is not built
+// with the sanitizers), for a child's environment.
+std::vector<std::string> RedirectedChildVariables();
+// The same as shell words, each quoted, with a trailing space.
+std::string RedirectedChildPrefix();
 
 // A reply frame: the 4-byte big-endian length of `body`, then `body`.
 std::string Frame(std::string_view body);
@@ -32,30 +50,15 @@ struct Answer {
     bool readRequest = true;   // false: close on accept, reading and sending nothing
 };
 
-// Holds the fixed socket path's test lock for its lifetime.
-class SocketPathLock {
-public:
-    SocketPathLock();
-    ~SocketPathLock();
-    SocketPathLock(const SocketPathLock &) = delete;
-    SocketPathLock &operator=(const SocketPathLock &) = delete;
-
-private:
-    int lockFd_;
-};
-
-// No collector at all: the path is locked and its socket file removed.
+// No collector at all: the private path holds no socket file.
 class NoCollector {
 public:
     NoCollector();
-
-private:
-    SocketPathLock lock_;
 };
 
 class TestCollector {
 public:
-    TestCollector();  // locks the path and listens on it; aborts the test program if it cannot
+    TestCollector();  // listens on the private path; aborts the test program if it cannot
     ~TestCollector();
     TestCollector(const TestCollector &) = delete;
     TestCollector &operator=(const TestCollector &) = delete;
@@ -74,7 +77,6 @@ private:
     void Serve();
     void Handle(int connection, const Answer &answer);
 
-    SocketPathLock lock_;
     int listenFd_ = -1;
     int stopPipe_[2] = {-1, -1};
     mutable std::mutex mutex_;

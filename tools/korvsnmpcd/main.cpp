@@ -11,10 +11,10 @@
 #include <cstring>
 #include <string>
 
-#include "collector_log.h"
+#include "protocol/unit_log.h"
 #include "sampler.h"
 #include "server.h"
-#include "unique_fd.h"
+#include "protocol/unique_fd.h"
 
 namespace {
 
@@ -82,15 +82,15 @@ bool Detach()
 {
     pid_t child = fork();
     if (child < 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot detach: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot detach: %m");
         return false;
     }
     if (child > 0)
         _exit(EXIT_SUCCESS);
     setsid();
     if (chdir("/") != 0)
-        KORVSNMPCD_LOG(LOG_WARNING, "Cannot change to /: %m");
-    korvsnmpcd::UniqueFd null(open("/dev/null", O_RDWR | O_CLOEXEC));
+        KORVSNMP_LOG(LOG_WARNING, "Cannot change to /: %m");
+    korvproto::UniqueFd null(open("/dev/null", O_RDWR | O_CLOEXEC));
     for (int stream : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
         if (null.Valid())
             dup2(null.Get(), stream);
@@ -121,7 +121,7 @@ int main(int argc, char **argv)
     korvsnmpcd::Sampler sampler;
     if (options.detach && !Detach())
         return EXIT_FAILURE;
-    KORVSNMPCD_LOG(LOG_INFO, "Listening on [%s], sampling every %lld ms",
+    KORVSNMP_LOG(LOG_INFO, "Listening on [%s], sampling every %lld ms",
                    options.server.socketPath.c_str(),
                    static_cast<long long>(options.server.interval.count()));
     bool served = server.Run(sampler);

@@ -3,7 +3,8 @@
 #include <algorithm>
 #include <memory>
 
-#include "collector_log.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unit_log.h"
 
 namespace korvsnmpcd {
 namespace {
@@ -12,13 +13,6 @@ constexpr char kLogUnit[] = "reply";
 constexpr char kReloadRequest[] = "reload";
 constexpr char kHistoryModeRequest[] = "history_mode";
 constexpr char kSpaceTotalDevice[] = "total";
-
-std::string Compact(const Json::Value &value)
-{
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    return Json::writeString(builder, value);
-}
 
 Json::Value BlockRecord(const std::string &device, const BlockRates &rates)
 {
@@ -114,7 +108,7 @@ Json::Value StatisticsReply(const Rates &rates, const Snapshot &sample)
 
 std::string StatisticsReplyText(const Rates &rates, const Snapshot &sample)
 {
-    return Compact(StatisticsReply(rates, sample));
+    return korvproto::CompactJson(StatisticsReply(rates, sample));
 }
 
 std::string AnswerRequest(std::string_view body, const std::string &statisticsReply)
@@ -135,26 +129,26 @@ std::string AnswerRequest(std::string_view body, const std::string &statisticsRe
         errors = error.what();
     }
     if (!parsed || !request.isObject()) {
-        KORVSNMPCD_LOG(LOG_WARNING, "Refused a request that is not a JSON object");
-        return Compact(Refusal("the request is not a JSON object"));
+        KORVSNMP_LOG(LOG_WARNING, "Refused a request that is not a JSON object");
+        return korvproto::CompactJson(Refusal("the request is not a JSON object"));
     }
 
     const Json::Value &object = request;
     const Json::Value &kind = object["request"];
     if (kind.isString() && kind.asString() == kReloadRequest) {
-        KORVSNMPCD_LOG(LOG_NOTICE, "Reload requested; nothing to reload, sampling goes on");
+        KORVSNMP_LOG(LOG_NOTICE, "Reload requested; nothing to reload, sampling goes on");
     } else if (kind.isString() && kind.asString() == kHistoryModeRequest) {
         const Json::Value &reason = object["reason"];
         std::string text = reason.isString() ? reason.asString()
                            : reason.isNull() ? std::string()
-                                             : Compact(reason);
-        KORVSNMPCD_LOG(LOG_NOTICE, "History mode requested, reason: [%s]", text.c_str());
+                                             : korvproto::CompactJson(reason);
+        KORVSNMP_LOG(LOG_NOTICE, "History mode requested, reason: [%s]", text.c_str());
     } else {
         return statisticsReply;
     }
     Json::Value success(Json::objectValue);
     success["success"] = true;
-    return Compact(success);
+    return korvproto::CompactJson(success);
 }
 
 }  // namespace korvsnmpcd

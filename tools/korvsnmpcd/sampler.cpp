@@ -10,12 +10,14 @@
 #include <chrono>
 #include <memory>
 
-#include "collector_log.h"
+#include "protocol/unit_log.h"
 #include "reply.h"
-#include "unique_fd.h"
+#include "protocol/unique_fd.h"
 
 namespace korvsnmpcd {
 namespace {
+
+using korvproto::UniqueFd;
 
 constexpr char kLogUnit[] = "sampler";
 constexpr size_t kReadChunk = 16384;
@@ -85,9 +87,9 @@ bool Sampler::ReadSource(const std::string &path, bool optional)
         text_.clear();
     if (ok) {
         if (unreadable_.erase(path) > 0)
-            KORVSNMPCD_LOG(LOG_NOTICE, "%s is readable again", path.c_str());
+            KORVSNMP_LOG(LOG_NOTICE, "%s is readable again", path.c_str());
     } else if (!optional && unreadable_.insert(path).second) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot read %s: %m; its statistics are left out", path.c_str());
+        KORVSNMP_LOG(LOG_ERR, "Cannot read %s: %m; its statistics are left out", path.c_str());
     }
     return ok;
 }

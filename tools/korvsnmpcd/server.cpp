@@ -11,7 +11,7 @@
 #include <cerrno>
 #include <cstring>
 
-#include "collector_log.h"
+#include "protocol/unit_log.h"
 #include "reply.h"
 
 namespace korvsnmpcd {
@@ -78,12 +78,12 @@ bool Server::Listen()
     sigaddset(&stopSignals, SIGTERM);
     sigaddset(&stopSignals, SIGINT);
     if (sigprocmask(SIG_BLOCK, &stopSignals, nullptr) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot block the stop signals: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot block the stop signals: %m");
         return false;
     }
     signals_ = UniqueFd(signalfd(-1, &stopSignals, SFD_NONBLOCK | SFD_CLOEXEC));
     if (!signals_.Valid()) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot watch the stop signals: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot watch the stop signals: %m");
         return false;
     }
     return TakeSocketPath();
@@ -94,42 +94,42 @@ bool Server::TakeSocketPath()
     const char *path = options_.socketPath.c_str();
     sockaddr_un address;
     if (!FillAddress(options_.socketPath, address)) {
-        KORVSNMPCD_LOG(LOG_ERR, "Socket path [%s] is empty or too long", path);
+        KORVSNMP_LOG(LOG_ERR, "Socket path [%s] is empty or too long", path);
         return false;
     }
 
     struct stat existing;
     if (lstat(path, &existing) == 0) {
         if (!S_ISSOCK(existing.st_mode)) {
-            KORVSNMPCD_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
+            KORVSNMP_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
             return false;
         }
         if (SomeoneAnswers(address)) {
-            KORVSNMPCD_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting",
+            KORVSNMP_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting",
                            path);
             return false;
         }
         if (errno != ECONNREFUSED) {
-            KORVSNMPCD_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
+            KORVSNMP_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
             return false;
         }
         if (unlink(path) != 0 && errno != ENOENT) {
-            KORVSNMPCD_LOG(LOG_ERR, "Cannot remove the stale socket file [%s]: %m", path);
+            KORVSNMP_LOG(LOG_ERR, "Cannot remove the stale socket file [%s]: %m", path);
             return false;
         }
-        KORVSNMPCD_LOG(LOG_NOTICE, "Replaced the stale socket file [%s]", path);
+        KORVSNMP_LOG(LOG_NOTICE, "Replaced the stale socket file [%s]", path);
     } else if (errno != ENOENT) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
+        KORVSNMP_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
         return false;
     }
 
     listening_ = UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
     if (!listening_.Valid()) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot create the listening socket: %m");
+        KORVSNMP_LOG(LOG_ERR, "Cannot create the listening socket: %m");
         return false;
     }
     if (bind(listening_.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot bind [%s]: %m", path);
+        KORVSNMP_LOG(LOG_ERR, "Cannot bind [%s]: %m", path);
         return false;
     }
     struct stat made;
@@ -139,9 +139,9 @@ bool Server::TakeSocketPath()
         ownsSocketFile_ = true;
     }
     if (chmod(path, kSocketMode) != 0)
-        KORVSNMPCD_LOG(LOG_WARNING, "Cannot open [%s] to every local user: %m", path);
+        KORVSNMP_LOG(LOG_WARNING, "Cannot open [%s] to every local user: %m", path);
     if (listen(listening_.Get(), SOMAXCONN) != 0) {
-        KORVSNMPCD_LOG(LOG_ERR, "Cannot listen on [%s]: %m", path);
+        KORVSNMP_LOG(LOG_ERR, "Cannot listen on [%s]: %m", path);
         return false;
     }
     return true;
@@ -182,7 +182,7 @@ bool Server::Run(Sampler &sampler)
 
         int ready = poll(watched.data(), watched.size(), MillisecondsUntil(wakeUp, now));
         if (ready < 0 && errno != EINTR) {
-            KORVSNMPCD_LOG(LOG_ERR, "poll() failed: %m");
+            KORVSNMP_LOG(LOG_ERR, "poll() failed: %m");
             return false;
         }
         if (ready <= 0)
@@ -191,7 +191,7 @@ bool Server::Run(Sampler &sampler)
         if (watched[0].revents != 0) {
             signalfd_siginfo info;
             if (read(signals_.Get(), &info, sizeof info) == static_cast<ssize_t>(sizeof info)) {
-                KORVSNMPCD_LOG(LOG_NOTICE, "Stopping on signal %u", info.ssi_signo);
+                KORVSNMP_LOG(LOG_NOTICE, "Stopping on signal %u", info.ssi_signo);
                 return true;
             }
         }
@@ -219,7 +219,7 @@ void Server::AcceptPending()
         if (!fd.Valid()) {
             if (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR &&
                 errno != ECONNABORTED)
-                KORVSNMPCD_LOG(LOG_ERR, "accept() failed: %m");
+                KORVSNMP_LOG(LOG_ERR, "accept() failed: %m");
             return;
         }
         auto connection = std::make_unique<Connection>();
@@ -245,12 +245,12 @@ void Server::Receive(Connection &connection, const Sampler &sampler)
         connection.request.Feed(buffer, static_cast<size_t>(got));
     }
     if (connection.request.Current() == RequestDecoder::State::kInvalid) {
-        KORVSNMPCD_LOG(LOG_WARNING, "Closed a connection whose request length is 0 or beyond %u",
-                       kMaxRequestBytes);
+        KORVSNMP_LOG(LOG_WARNING, "Closed a connection whose request length is 0 or beyond %u",
+                       korvproto::kMaxRequestBytes);
         connection.done = true;
         return;
     }
-    connection.reply = FrameReply(AnswerRequest(connection.request.Body(),
+    connection.reply = korvproto::EncodeFrame(AnswerRequest(connection.request.Body(),
                                                 sampler.StatisticsReply()));
     Send(connection);
 }

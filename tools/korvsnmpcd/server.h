@@ -17,13 +17,16 @@
 #include <string>
 #include <vector>
 
-#include "framing.h"
+#include "protocol/collector_protocol.h"
+#include "protocol/unique_fd.h"
 #include "sampler.h"
-#include "unique_fd.h"
 
 namespace korvsnmpcd {
 
-constexpr char kDefaultSocketPath[] = "/tmp/korvsnmpcd.sock";
+using korvproto::RequestDecoder;
+using korvproto::UniqueFd;
+
+inline constexpr const char *kDefaultSocketPath = korvproto::kCollectorSocketPath;
 
 struct ServerOptions {
     std::string socketPath = kDefaultSocketPath;

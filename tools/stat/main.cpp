@@ -7,10 +7,9 @@
 #include <utility>
 #include <vector>
 
-#include <json/writer.h>
-
 #include "korvsnmp/korvsnmp.h"
 #include "options.h"
+#include "protocol/collector_protocol.h"
 #include "table_format.h"
 
 namespace {
@@ -41,7 +40,7 @@ void Print(const Json::Value &result, korvstat::Format format)
         korvstat::WriteTables(result, std::cout);
         break;
     case korvstat::Format::CompactJson:
-        std::cout << Json::FastWriter().write(result);
+        std::cout << korvproto::CompactJson(result) << '\n';
         break;
     case korvstat::Format::PrettyJson:
         std::cout << result.toStyledString();
@@ -54,7 +53,8 @@ int Statistics(const korvstat::Options &options)
     const Json::Value request = BuildRequest(options.resources);
     Transmitor transmitor(kHostName);
     if (transmitor.Transmit(request) != 0)
-        return Fail("no statistics from the collector on /tmp/korvsnmpcd.sock");
+        return Fail(std::string("no statistics from the collector on ") +
+                    korvproto::kCollectorSocketPath);
     Json::Value reply;
     if (transmitor.GetDataJson(reply) != 0)
         return Fail("the collector's reply is not JSON");

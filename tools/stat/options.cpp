@@ -3,14 +3,16 @@
 #include <algorithm>
 #include <sstream>
 
+#include "protocol/collector_protocol.h"
+
 namespace korvstat {
 
-const char kUsage[] =
-    "Usage: korvsnmp-stat [--resource LIST] [--format json|table] [--compact]\n"
+const std::string kUsage =
+    std::string("Usage: korvsnmp-stat [--resource LIST] [--format json|table] [--compact]\n"
     "       korvsnmp-stat --reload\n"
     "       korvsnmp-stat --history-mode REASON\n"
-    "\n"
-    "Asks the collector daemon korvsnmpcd (on /tmp/korvsnmpcd.sock) for the\n"
+    "\n") +
+    "Asks the collector daemon korvsnmpcd (on " + korvproto::kCollectorSocketPath + ") for the\n"
     "appliance's current statistics, names them from the host's configuration\n"
     "with libkorvsnmp, and prints them.\n"
     "\n"

@@ -23,7 +23,7 @@ const std::vector<std::string> &KnownResources();
 // Parses argv[1..]. False with `error` set on a bad command line.
 bool ParseOptions(const std::vector<std::string> &arguments, Options &options, std::string &error);
 
-extern const char kUsage[];
+extern const std::string kUsage;
 
 }  // namespace korvstat
 

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include <json/writer.h>
+#include "protocol/collector_protocol.h"
 
 namespace korvstat {
 namespace {
@@ -12,21 +12,13 @@ namespace {
 constexpr char kMissing[] = "-";
 constexpr char kColumnGap[] = "  ";
 
-std::string Compact(const Json::Value &value)
-{
-    std::string text = Json::FastWriter().write(value);
-    if (!text.empty() && text.back() == '\n')
-        text.pop_back();
-    return text;
-}
-
 std::string CellText(const Json::Value &value)
 {
     if (value.isNull())
         return kMissing;
     if (value.isString())
         return value.asString();
-    return Compact(value);
+    return korvproto::CompactJson(value);
 }
 
 using Row = std::vector<std::string>;

@@ -1,12 +1,12 @@
-// Owns one file descriptor and closes it when it goes.
-#ifndef KORVSNMPCD_UNIQUE_FD_H
-#define KORVSNMPCD_UNIQUE_FD_H
+// Owns one file descriptor and closes it, once, when it goes.
+#ifndef KORVPROTO_UNIQUE_FD_H
+#define KORVPROTO_UNIQUE_FD_H
 
 #include <unistd.h>
 
 #include <utility>
 
-namespace korvsnmpcd {
+namespace korvproto {
 
 class UniqueFd {
 public:
@@ -27,6 +27,9 @@ public:
 
     int Get() const { return fd_; }
     bool Valid() const { return fd_ >= 0; }
+    // Hands the descriptor over without closing it; the holder is empty after.
+    int Release() { return std::exchange(fd_, -1); }
+    // Closes the descriptor held, if any; the holder is empty after.
     void Reset()
     {
         if (fd_ >= 0)
@@ -38,6 +41,6 @@ private:
     int fd_ = -1;
 };
 
-}  // namespace korvsnmpcd
+}  // namespace korvproto
 
 #endif
