@@ -2,6 +2,7 @@
 // LUN's UUID to "uuid" and "lun_name".
 #include "korvsnmp/fill_in_current_lun_io.h"
 
+#include <deque>
 #include <string_view>
 #include <unordered_map>
 #include <utility>
@@ -26,10 +27,10 @@ constexpr char kUuidKey[] = "uuid";
 constexpr char kLunNameKey[] = "lun_name";
 
 // The LUN list's UUIDs and names, moved out of the web API's answer, and
-// the names by UUID (viewed in `lunList`, which is not resized once filled).
+// the names by UUID (viewed in `lunList`, whose elements never move).
 // A later LUN with the same UUID replaces the earlier one's name.
 struct LunNameMap {
-    std::vector<std::pair<Json::Value, Json::Value>> lunList;  // UUID, name
+    std::deque<std::pair<Json::Value, Json::Value>> lunList;  // UUID, name
     std::unordered_map<std::string_view, const Json::Value *> names;
 };
 
@@ -101,8 +102,8 @@ LunNameMap FetchLunNames()
         KORVSNMP_LOG(LOG_ERR, "LUNs json data not found");
         return map;
     }
-    map.lunList.reserve(luns->size());
-    map.names.reserve(luns->size());
+    // The list grows as the answer's LUN objects go, so that the two are
+    // never held whole at once.
     for (Json::Value &lun : *luns) {
         if (!lun.isObject())
             continue;
@@ -113,6 +114,7 @@ LunNameMap FetchLunNames()
         // A moved string keeps its characters where they are: the view stays valid.
         map.lunList.emplace_back(std::move(*uuid), std::move(*name));
         map.names[View(map.lunList.back().first)] = &map.lunList.back().second;
+        lun = Json::Value();  // what is left of it goes now, not with the whole answer
     }
     return map;
 }
