@@ -6,8 +6,10 @@
 //   road:     Transmit + GetDataJson + SNMPParseReplyData (copying the reply)
 //   moving road: the same, the parsed reply handed over with std::move
 //   assembly, moving assembly: SNMPParseReplyData alone
-//   platform: the time that a moving road spends inside the platform's
-//             operations and the system calls that the spaces need
+//   platform: what a moving road must spend beyond the floor whatever the
+//             library does: the platform's operations, the stat and readlink
+//             calls of the spaces, and the socket calls beyond the floor's
+//             (1024-byte reads, the waits)
 //
 // Without arguments it measures the peak memory of one road (every malloc of
 // the process counted), then runs the probes interleaved, one iteration of
@@ -147,18 +149,21 @@ int posix_memalign(void **out, size_t alignment, size_t size)
 
 // ---- The platform's own time ------------------------------------------------
 //
-// Every platform operation, and the system calls that the library must make
-// for the spaces (stat, readlink), pass through a wrapper here that forwards
-// to the real one. While timing is on, the wrappers add up the time spent
-// inside them (the outermost call only); otherwise they only forward.
+// Every platform operation, the system calls that the library must make for
+// the spaces (stat, readlink) and the socket calls pass through a wrapper
+// here that forwards to the real one. While timing is on (on this thread),
+// the wrappers add up the time spent inside them, the outermost call only;
+// otherwise they only forward.
 
 namespace {
+// What a timed call is.
+enum CallKind { kPlatformCall, kSpaceCall, kSocketCall, kCallKinds };
+
 struct PlatformClock {
     bool on = false;
     int depth = 0;
-    long long platformNs = 0;
-    long long syscallNs = 0;
-    long long calls = 0;
+    long long ns[kCallKinds] = {};
+    long long calls[kCallKinds] = {};
 };
 thread_local PlatformClock tPlatform;
 
@@ -180,18 +185,18 @@ Function Next(const char *symbol)
     return reinterpret_cast<Function>(found);
 }
 
-// Runs `call`, adding its time to `sum` while timing is on.
+// Runs `call`, adding its time to the sum of its `kind` while timing is on.
 template <typename Call>
-auto Timed(long long PlatformClock::*sum, Call call)
+auto Timed(CallKind kind, Call call)
 {
     PlatformClock &clock = tPlatform;
     if (!clock.on || clock.depth > 0)
         return call();
     ++clock.depth;
-    ++clock.calls;
+    ++clock.calls[kind];
     const long long start = NowNs();
     auto result = call();
-    clock.*sum += NowNs() - start;
+    clock.ns[kind] += NowNs() - start;
     --clock.depth;
     return result;
 }
@@ -199,7 +204,7 @@ auto Timed(long long PlatformClock::*sum, Call call)
 template <typename Call>
 void TimedVoid(Call call)
 {
-    Timed(&PlatformClock::platformNs, [&] {
+    Timed(kPlatformCall, [&] {
         call();
         return 0;
     });
@@ -210,7 +215,7 @@ void TimedVoid(Call call)
     extern "C" result name params                                                       \
     {                                                                                   \
         static const auto next = Next<result(*) params>(#name);                         \
-        return Timed(&PlatformClock::platformNs, [&] { return next args; });            \
+        return Timed(kPlatformCall, [&] { return next args; });            \
     }
 #define KORVBENCH_FORWARD_VOID(name, params, args)                                       \
     extern "C" void name params                                                         \
@@ -267,7 +272,7 @@ int KORV::APIRunner::Exec(Json::Value &response, const std::string &api, int ver
     static const auto next = Next<Function>(
         "_ZN4KORV9APIRunner4ExecERN4Json5ValueERKNSt7__cxx1112basic_stringIcSt11char_"
         "traitsIcESaIcEEEiSB_RKS2_SB_");
-    return Timed(&PlatformClock::platformNs,
+    return Timed(kPlatformCall,
                  [&] { return next(response, api, version, method, params, user); });
 }
 
@@ -277,20 +282,38 @@ bool KORV::WebAPIUtil::JsonArrayHasString(const Json::Value &array, const std::s
     static const auto next = Next<Function>(
         "_ZN4KORV10WebAPIUtil18JsonArrayHasStringERKN4Json5ValueERKNSt7__cxx1112basic_"
         "stringIcSt11char_traitsIcESaIcEEE");
-    return Timed(&PlatformClock::platformNs, [&] { return next(array, name); });
+    return Timed(kPlatformCall, [&] { return next(array, name); });
 }
 
 extern "C" int stat(const char *__restrict path, struct stat *__restrict buffer) noexcept
 {
     static const auto next = Next<int (*)(const char *, struct stat *)>("stat");
-    return Timed(&PlatformClock::syscallNs, [&] { return next(path, buffer); });
+    return Timed(kSpaceCall, [&] { return next(path, buffer); });
 }
 
 extern "C" ssize_t readlink(const char *__restrict path, char *__restrict buffer, size_t size) noexcept
 {
     static const auto next = Next<ssize_t (*)(const char *, char *, size_t)>("readlink");
-    return Timed(&PlatformClock::syscallNs, [&] { return next(path, buffer, size); });
+    return Timed(kSpaceCall, [&] { return next(path, buffer, size); });
 }
+
+#define KORVBENCH_SOCKET_CALL(result, name, params, args)                              \
+    extern "C" result name params noexcept                                              \
+    {                                                                                   \
+        static const auto next = Next<result(*) params>(#name);                         \
+        return Timed(kSocketCall, [&] { return next args; });                           \
+    }
+KORVBENCH_SOCKET_CALL(int, socket, (int domain, int type, int protocol), (domain, type, protocol))
+KORVBENCH_SOCKET_CALL(int, connect, (int fd, const sockaddr *address, socklen_t length),
+                      (fd, address, length))
+KORVBENCH_SOCKET_CALL(int, select,
+                      (int count, fd_set *readable, fd_set *writable, fd_set *failed, timeval *wait),
+                      (count, readable, writable, failed, wait))
+KORVBENCH_SOCKET_CALL(ssize_t, read, (int fd, void *buffer, size_t size), (fd, buffer, size))
+KORVBENCH_SOCKET_CALL(ssize_t, write, (int fd, const void *buffer, size_t size), (fd, buffer, size))
+KORVBENCH_SOCKET_CALL(ssize_t, send, (int fd, const void *buffer, size_t size, int flags),
+                      (fd, buffer, size, flags))
+KORVBENCH_SOCKET_CALL(int, close, (int fd), (fd))
 
 // The library's messages (failures only) go to standard error, not to the
 // system log.
@@ -847,15 +870,30 @@ void RunProbe(Probes &probes, int probe)
 struct Interleaved {
     double ns[kProbeCount] = {};            // medians
     double instructions[kProbeCount] = {};  // medians; 0 where not counted
-    double platformCalls = 0;
-    double syscallNs = 0;  // part of ns[kPlatformProbe]: stat and readlink
+    // Within a moving road: the platform's operations, stat and readlink,
+    // and the socket calls; and the floor's socket calls (medians).
+    double roadNs[kCallKinds] = {};
+    double roadCalls[kCallKinds] = {};
+    double floorSocketNs = 0;
 };
+
+// The timed calls' sums of one probe, less the clock readings' own cost.
+void TakeSums(const PlatformClock &clock, double overhead, std::vector<double> (&ns)[kCallKinds],
+              double (&calls)[kCallKinds])
+{
+    for (int kind = 0; kind < kCallKinds; ++kind) {
+        ns[kind].push_back(clock.ns[kind] - clock.calls[kind] * overhead);
+        calls[kind] = static_cast<double>(clock.calls[kind]);
+    }
+}
 
 Interleaved RunInterleaved(Probes &probes, int rounds)
 {
     constexpr int kWarmUpRounds = 5;
     InstructionCounter counter;
-    std::vector<double> ns[kProbeCount], instructions[kProbeCount], syscalls;
+    std::vector<double> ns[kProbeCount], instructions[kProbeCount];
+    std::vector<double> roadNs[kCallKinds], floorNs[kCallKinds];
+    double floorCalls[kCallKinds] = {};
     const double overhead = TimingOverheadNs();
     Interleaved figures;
     for (int round = -kWarmUpRounds; round < rounds; ++round) {
@@ -864,6 +902,15 @@ Interleaved RunInterleaved(Probes &probes, int rounds)
             if (probe == kMovingAssembly)
                 reply = probes.parsedReply;
             PlatformClock &clock = tPlatform;
+            if (probe == kPlatformProbe) {
+                // The floor's socket calls, timed the same way as the road's.
+                clock = PlatformClock{};
+                clock.on = true;
+                RunProbe(probes, kFloor, reply);
+                clock.on = false;
+                if (round >= 0)
+                    TakeSums(clock, overhead, floorNs, floorCalls);
+            }
             clock = PlatformClock{};
             clock.on = probe == kPlatformProbe;
             const long long startInstructions = counter.Read();
@@ -875,11 +922,7 @@ Interleaved RunInterleaved(Probes &probes, int rounds)
             if (round < 0)
                 continue;
             if (probe == kPlatformProbe) {
-                // Two clock readings per timed call belong to the bookkeeping.
-                const double bookkeeping = clock.calls * overhead;
-                ns[probe].push_back(clock.platformNs + clock.syscallNs - bookkeeping);
-                syscalls.push_back(clock.syscallNs);
-                figures.platformCalls = static_cast<double>(clock.calls);
+                TakeSums(clock, overhead, roadNs, figures.roadCalls);
             } else {
                 ns[probe].push_back(static_cast<double>(elapsed));
                 if (counter.Available())
@@ -891,7 +934,14 @@ Interleaved RunInterleaved(Probes &probes, int rounds)
         figures.ns[probe] = Median(ns[probe]);
         figures.instructions[probe] = Median(instructions[probe]);
     }
-    figures.syscallNs = Median(syscalls);
+    for (int kind = 0; kind < kCallKinds; ++kind)
+        figures.roadNs[kind] = Median(roadNs[kind]);
+    figures.floorSocketNs = Median(floorNs[kSocketCall]);
+    // What the road spends beyond the floor's own work, because the library
+    // must: the platform's operations, stat and readlink, and the socket
+    // calls that the road makes beyond the floor's (1024-byte reads, waits).
+    figures.ns[kPlatformProbe] = figures.roadNs[kPlatformCall] + figures.roadNs[kSpaceCall] +
+                                 std::max(0.0, figures.roadNs[kSocketCall] - figures.floorSocketNs);
     return figures;
 }
 
@@ -1037,8 +1087,12 @@ int main(int argc, char **argv)
                         run.instructions[probe] / run.instructions[kFloor]);
         std::printf("\n");
     }
-    std::printf("  platform: %.0f calls per road; stat and readlink %.1f us of it\n",
-                run.platformCalls, run.syscallNs / 1000);
+    std::printf("  platform: %.1f us in %.0f operations; stat and readlink %.1f us in %.0f calls;\n"
+                "            socket calls %.1f us in %.0f calls (the floor's %.1f us)\n",
+                run.roadNs[kPlatformCall] / 1000, run.roadCalls[kPlatformCall],
+                run.roadNs[kSpaceCall] / 1000, run.roadCalls[kSpaceCall],
+                run.roadNs[kSocketCall] / 1000, run.roadCalls[kSocketCall],
+                run.floorSocketNs / 1000);
 
     const double ownShare = (run.ns[kMovingRoad] - floor - run.ns[kPlatformProbe]) / floor;
     std::printf("road/floor: %.3f\n", run.ns[kRoad] / floor);
