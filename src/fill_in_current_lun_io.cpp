@@ -61,15 +61,18 @@ std::string_view View(const Json::Value &text)
 bool ReadDevices(const Json::Value &lunIO, std::vector<const Json::Value *> &devices)
 {
     devices.reserve(lunIO.size());
-    for (Json::ArrayIndex index = 0; index < lunIO.size(); ++index) {
-        const Json::Value &record = lunIO[index];
+    // By iterator, as the rewrite walks them: an index that a sparse array
+    // lacks is neither checked nor rewritten.
+    for (auto element = lunIO.begin(); element != lunIO.end(); ++element) {
+        const Json::Value &record = *element;
         if (!korvsnmp::IsRecord(record)) {
-            KORVSNMP_LOG(LOG_ERR, "LunIO element %u is not an object", index);
+            KORVSNMP_LOG(LOG_ERR, "LunIO element %u is not an object", element.index());
             return false;
         }
         const Json::Value *device = record.isObject() ? Member(record, kDeviceKey) : nullptr;
         if (device != nullptr && !device->isString()) {
-            KORVSNMP_LOG(LOG_ERR, "LunIO element %u: \"%s\" is not a string", index, kDeviceKey);
+            KORVSNMP_LOG(LOG_ERR, "LunIO element %u: \"%s\" is not a string", element.index(),
+                         kDeviceKey);
             return false;
         }
         devices.push_back(device);

@@ -1,6 +1,7 @@
 // The LUN names held over a long LUN list: the names by UUID must survive
 // the list's growth, duplicates included (the later LUN's name counts).
 #include <string>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -33,6 +34,24 @@ TEST(LunNameMapTest, EveryRecordOfALongListGetsItsOwnName)
         ASSERT_FALSE(record.isMember("device"));
     }
     EXPECT_EQ(records[kLuns]["lun_name"].asString(), "uuid-unlisted");
+}
+
+// An array with a hole (index 1 never set): the records on either side get
+// their own names, and the hole stays as it was.
+TEST(LunNameMapTest, ARecordAfterAHoleGetsItsOwnName)
+{
+    korvstandin::Reset();
+    korvstandin::Host().luns = {{Json::Value("u-0"), Json::Value("zero")},
+                                {Json::Value("u-2"), Json::Value("two")}};
+    Json::Value records(Json::arrayValue);
+    records[0]["device"] = "u-0";
+    records[2]["device"] = "u-2";
+
+    ASSERT_TRUE(KORVSNMP::FillInCurrentLunIO(records));
+    EXPECT_EQ(records[0]["lun_name"].asString(), "zero");
+    EXPECT_EQ(records[2]["lun_name"].asString(), "two");
+    EXPECT_EQ(records[2]["uuid"].asString(), "u-2");
+    EXPECT_TRUE(std::as_const(records)[1].isNull());
 }
 
 }  // namespace
