@@ -76,7 +76,7 @@ std::atomic<bool> gCounting{false};
 std::atomic<long long> gLiveBytes{0};  // since counting began; frees of older blocks count too
 std::atomic<long long> gPeakBytes{0};
 
-void Count(void *block)
+[[maybe_unused]] void Count(void *block)
 {
     if (block == nullptr || !gCounting.load(std::memory_order_relaxed))
         return;
@@ -88,7 +88,7 @@ void Count(void *block)
     }
 }
 
-void Uncount(void *block)
+[[maybe_unused]] void Uncount(void *block)
 {
     if (block != nullptr && gCounting.load(std::memory_order_relaxed))
         gLiveBytes.fetch_sub(static_cast<long long>(malloc_usable_size(block)),
