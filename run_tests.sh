@@ -10,7 +10,8 @@ if [ "$(id -u)" -eq 0 ]; then as_root=; else as_root=sudo; fi
 $as_root apt-get update -qq
 $as_root env DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends \
     ca-certificates cmake make g++ binutils pkg-config libjsoncpp-dev libgtest-dev libgmock-dev \
-    libbenchmark-dev >/dev/null
+    libbenchmark-dev python3-prometheus-client mandoc dpkg-dev file lintian \
+    snmpd snmp smitools libsmi2-common libsnmp-dev >/dev/null
 
 jobs=$(nproc 2>/dev/null || echo 2)
 
@@ -18,7 +19,7 @@ run() {
     dir=$1
     shift
     echo "==> $dir: configure, build, test"
-    cmake -S . -B "$dir" -DCMAKE_BUILD_TYPE=RelWithDebInfo "$@" >/dev/null
+    cmake -S . -B "$dir" -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKORVSNMP_WERROR=ON "$@" >/dev/null
     cmake --build "$dir" -j "$jobs"
     (cd "$dir" && ctest --output-on-failure -j "$jobs")
 }

@@ -11,10 +11,12 @@
 #include <new>
 #include <string>
 
+#include <korv_platform.h>
+
 #include "json_read.h"
 #include "json_take.h"
-#include "korv_platform.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
+#include "platform_text.h"
 #include "protocol/unit_log.h"
 
 namespace {
@@ -76,8 +78,6 @@ __attribute__((format(printf, 3, 4))) void FormatCut(char *buffer, size_t size,
         buffer[0] = '\0';
     va_end(args);
 }
-
-std::string FieldText(const char *field, size_t size) { return {field, strnlen(field, size)}; }
 
 // ---- Internal and expansion-unit disks ----------------------------------------
 
@@ -161,7 +161,7 @@ void LoadVolumeText(const char *key, TextTable &table)
 std::string GetVolumeText(const TextTable &table, const char *key)
 {
     const char *text = table.Allocated() ? KLIBCSzHashGetValue(table.Hash(), key) : nullptr;
-    return text != nullptr ? FieldText(text, kTextSize) : std::string();
+    return text != nullptr ? korvread::FieldText(text, kTextSize) : std::string();
 }
 
 // The first powered unit whose disk-path list holds `devicePath`, or null.
@@ -241,7 +241,7 @@ DiskName GetDiskDisplayName(const DiskInfo &disk, const EBoxWrapper *wrappers)
 
 std::string DeviceNameOf(const DiskInfo &disk)
 {
-    std::string path = FieldText(disk.devicePath, sizeof disk.devicePath);
+    std::string path = korvread::FieldText(disk.devicePath, sizeof disk.devicePath);
     if (path.compare(0, kDevicePrefixLength, kDevicePrefix) == 0)
         path.erase(0, kDevicePrefixLength);
     return path;
@@ -329,7 +329,7 @@ bool KORVExternalDevEnum(DiskNameMap &names, int kind)
         if (KORVExtStgPartsVolInfoGet(device, info.get(), isUsb ? kInfoFlagUsb : kInfoFlagOther) < 0)
             continue;
         DiskName &name = names[device];
-        name.displayName = FieldText(info->displayName, sizeof info->displayName);
+        name.displayName = korvread::FieldText(info->displayName, sizeof info->displayName);
         name.type = type;
     }
     return true;
@@ -341,16 +341,14 @@ bool KORVExternalDevEnum(DiskNameMap &names, int kind)
 // an element that the collector cannot have meant.
 bool ReadDevice(const Json::Value &element, Json::ArrayIndex index, std::string &device)
 {
-    if (!korvsnmp::IsRecord(element)) {
+    if (!korvread::IsRecord(element)) {
         KORVSNMP_LOG(LOG_ERR, "DiskIO element %u is not an object", index);
         return false;
     }
-    const Json::Value &member = element["device"];
-    if (!member.isNull() && !member.isString()) {
+    if (!korvread::ReadDeviceName(element, device)) {
         KORVSNMP_LOG(LOG_ERR, "DiskIO element %u: \"device\" is not a string", index);
         return false;
     }
-    device = member.isString() ? member.asString() : std::string();
     return true;
 }
 
@@ -361,7 +359,7 @@ bool FillIn(Records &diskIO, Json::Value &out)
 {
     if (!diskIO.isArray())
         return false;
-    if (!korvsnmp::IsRecord(out)) {
+    if (!korvread::IsRecord(out)) {
         KORVSNMP_LOG(LOG_ERR, "disk output is not an object");
         return false;
     }
@@ -389,7 +387,7 @@ bool FillIn(Records &diskIO, Json::Value &out)
         record["type"] = found->second.type;
         for (size_t counter = 0; counter < kCounterCount; ++counter) {
             unsigned int value = 0;
-            if (!korvsnmp::ReadUInt32(record[kCounterNames[counter]], value)) {
+            if (!korvread::ReadUInt32(record[kCounterNames[counter]], value)) {
                 KORVSNMP_LOG(LOG_ERR,
                              "DiskIO device [%s]: \"%s\" is not an unsigned 32-bit number",
                              device.c_str(), kCounterNames[counter]);

@@ -55,9 +55,9 @@ std::string_view View(const Json::Value &text)
     return text.getString(&begin, &end) ? std::string_view(begin, end - begin) : std::string_view();
 }
 
-// Every record must be an object (or null) whose "device", when present, is
-// a string; otherwise nothing of `lunIO` may be rewritten. Collects each
-// record's "device" (null where it has none) for the rewrite.
+// Every record must follow the record rule (json_read.h); otherwise nothing
+// of `lunIO` may be rewritten. Collects each record's "device" (a null
+// pointer where it has none) for the rewrite.
 bool ReadDevices(const Json::Value &lunIO, std::vector<const Json::Value *> &devices)
 {
     devices.reserve(lunIO.size());
@@ -65,12 +65,12 @@ bool ReadDevices(const Json::Value &lunIO, std::vector<const Json::Value *> &dev
     // lacks is neither checked nor rewritten.
     for (auto element = lunIO.begin(); element != lunIO.end(); ++element) {
         const Json::Value &record = *element;
-        if (!korvsnmp::IsRecord(record)) {
+        if (!korvread::IsRecord(record)) {
             KORVSNMP_LOG(LOG_ERR, "LunIO element %u is not an object", element.index());
             return false;
         }
         const Json::Value *device = record.isObject() ? Member(record, kDeviceKey) : nullptr;
-        if (device != nullptr && !device->isString()) {
+        if (device != nullptr && !device->isString() && !device->isNull()) {
             KORVSNMP_LOG(LOG_ERR, "LunIO element %u: \"%s\" is not a string", element.index(),
                          kDeviceKey);
             return false;
@@ -147,12 +147,12 @@ bool FillInCurrentLunIO(Json::Value &lunIO)
         const auto named = names.find(device != nullptr ? View(*device) : std::string_view());
         // "device" becomes "uuid": its string moves over before the member goes.
         Json::Value &uuid = record[kUuidKey];
-        if (device != nullptr) {
+        if (device != nullptr && device->isString())
             uuid = std::move(*const_cast<Json::Value *>(device));
+        else
+            uuid = "";  // no "device", or a null one
+        if (device != nullptr)
             record.removeMember(kDeviceKey);
-        } else {
-            uuid = "";
-        }
         record[kLunNameKey] = named != names.end() ? *named->second : uuid;
     }
     return true;

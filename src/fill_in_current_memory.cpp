@@ -20,7 +20,7 @@ namespace KORVSNMP {
 
 bool FillInCurrentMemory(const Json::Value &record, Json::Value &memory)
 {
-    if (!korvsnmp::IsRecord(record)) {
+    if (!korvread::IsRecord(record)) {
         KORVSNMP_LOG(LOG_ERR, "Memory record is not an object");
         return false;
     }
@@ -30,7 +30,7 @@ bool FillInCurrentMemory(const Json::Value &record, Json::Value &memory)
         return false;
     }
     unsigned int totalReal = 0;
-    if (!korvsnmp::ReadUInt32(record[kTotalRealKey], totalReal)) {
+    if (!korvread::ReadUInt32(record[kTotalRealKey], totalReal)) {
         KORVSNMP_LOG(LOG_ERR, "Memory: \"%s\" is not an unsigned 32-bit number", kTotalRealKey);
         return false;
     }

@@ -8,10 +8,12 @@
 #include <string>
 #include <vector>
 
+#include <korv_core.h>
+#include <korv_net.h>
+
 #include "json_read.h"
-#include "korv_core.h"
-#include "korv_net.h"
 #include "korvsnmp/fill_in_current_network.h"
+#include "platform_text.h"
 #include "protocol/unit_log.h"
 
 namespace {
@@ -44,13 +46,6 @@ struct Counters {
     }
 };
 
-// A name field of a fixed record, which the platform may fill to the brim.
-template <size_t N>
-std::string FixedText(const char (&field)[N])
-{
-    return std::string(field, strnlen(field, N));
-}
-
 // True when `a` sorts before `b`: bytes compared as unsigned values over the
 // shorter length, then the shorter name first.
 bool CompareIfName(const std::string &a, const std::string &b)
@@ -73,10 +68,10 @@ bool GetNetInterfaceList(InterfaceNames &names, AggregationMap &aggregations)
     }
 
     for (int i = 0; i < std::min(listed, kInterfaceCapacity); ++i) {
-        const std::string name = FixedText(records[i].name);
+        const std::string name = korvread::FieldText(records[i].name);
         const int vlanAnswer = KLIBNetVlanGet(name.c_str(), &vlan);
         if (vlanAnswer == kVlanAnswerVlan) {
-            names.push_back(FixedText(vlan.name));
+            names.push_back(korvread::FieldText(vlan.name));
             continue;
         }
         if (vlanAnswer != kVlanAnswerNotVlan)
@@ -95,7 +90,7 @@ bool GetNetInterfaceList(InterfaceNames &names, AggregationMap &aggregations)
             std::vector<std::string> &memberNames = aggregations[name];
             memberNames.clear();
             for (int slot = 0; slot < members; ++slot)
-                memberNames.push_back(FixedText(aggregation.members[slot]));
+                memberNames.push_back(korvread::FieldText(aggregation.members[slot]));
         } else {
             // A master named with four characters or fewer is listed with the empty name.
             names.push_back(name.size() > kOvsMasterPrefixLength ? name.substr(kOvsMasterPrefixLength)
@@ -122,7 +117,7 @@ bool ReadCounters(const Json::Value &element, const std::string &device, Counter
 {
     for (auto [member, counter] : {std::pair{"rx", &counters.rx}, std::pair{"tx", &counters.tx}}) {
         unsigned int value = 0;
-        if (!korvsnmp::ReadUInt32(element[member], value)) {
+        if (!korvread::ReadUInt32(element[member], value)) {
             KORVSNMP_LOG(LOG_ERR, "Network device [%s]: \"%s\" is not an unsigned 32-bit number",
                          device.c_str(), member);
             return false;
@@ -135,7 +130,7 @@ bool ReadCounters(const Json::Value &element, const std::string &device, Counter
 bool AllRecords(const Json::Value &network)
 {
     for (Json::ArrayIndex i = 0; i < network.size(); ++i) {
-        if (!korvsnmp::IsRecord(network[i])) {
+        if (!korvread::IsRecord(network[i])) {
             KORVSNMP_LOG(LOG_ERR, "Network element %u is not an object", i);
             return false;
         }
@@ -154,7 +149,9 @@ Json::Value Record(const std::string &device, const Counters &counters)
 
 }  // namespace
 
-bool KORVSNMP::FillInCurrentNetwork(const Json::Value &network, Json::Value &output)
+namespace KORVSNMP {
+
+bool FillInCurrentNetwork(const Json::Value &network, Json::Value &output)
 {
     if (!network.isArray()) {
         KORVSNMP_LOG(LOG_ERR, "ReplyNetwork is not array");
@@ -206,7 +203,7 @@ bool KORVSNMP::FillInCurrentNetwork(const Json::Value &network, Json::Value &out
     // name; they are not counted. An empty name is taken for no link.
     char pppoeBuffer[kPppoeNameSize] = {};
     if (KORVPPPoeIntfGet(pppoeBuffer, kPppoeNameSize) == 0) {
-        const std::string pppoe = FixedText(pppoeBuffer);
+        const std::string pppoe = korvread::FieldText(pppoeBuffer);
         for (const Json::Value &element : network) {
             const Json::Value &device = element["device"];
             if (!pppoe.empty() && device.isString() &&
@@ -220,3 +217,5 @@ bool KORVSNMP::FillInCurrentNetwork(const Json::Value &network, Json::Value &out
     output = std::move(result);
     return true;
 }
+
+}  // namespace KORVSNMP

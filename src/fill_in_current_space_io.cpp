@@ -21,6 +21,7 @@
 
 #include "json_read.h"
 #include "json_take.h"
+#include "platform_text.h"
 #include "protocol/unit_log.h"
 
 namespace {
@@ -52,13 +53,7 @@ using FlashCacheList = std::unique_ptr<FlashCacheConfig, decltype(&KORVFlashCach
 
 // `text` as it fits a display-name buffer: at most its first 1023 characters
 // (cutting a longer text is intended).
-std::string DisplayName(const char *text)
-{
-    char buffer[kDisplayNameSize] = {};
-    if (std::snprintf(buffer, sizeof buffer, "%s", text) < 0)
-        return std::string();
-    return buffer;
-}
+std::string DisplayName(const std::string &text) { return text.substr(0, kDisplayNameSize - 1); }
 
 // Reads the sysfs link of the block device that the node at `path` stands
 // for into `target`, which always stays terminated. True when the target has
@@ -126,7 +121,7 @@ void AddFlashCacheNames(SpaceNameMap &names, std::vector<std::string> &cachedSpa
 
 // Removes the first entry of `cachedSpaces` equal to `devicePath`; true when
 // there was one.
-bool TakeCachedSpace(std::vector<std::string> &cachedSpaces, const char *devicePath)
+bool TakeCachedSpace(std::vector<std::string> &cachedSpaces, const std::string &devicePath)
 {
     const auto cached = std::find(cachedSpaces.begin(), cachedSpaces.end(), devicePath);
     if (cached == cachedSpaces.end())
@@ -149,10 +144,11 @@ bool EnumSpaceNames(SpaceNameMap &names)
     AddFlashCacheNames(names, cachedSpaces);
 
     for (const SpaceInfo *space = spaces.get(); space != nullptr; space = space->next) {
-        if (TakeCachedSpace(cachedSpaces, space->devicePath))
+        const std::string devicePath = korvread::FieldText(space->devicePath);
+        if (TakeCachedSpace(cachedSpaces, devicePath))
             continue;
-        std::string name = DisplayName(space->name);
-        const std::string key = KernelName(space->devicePath);
+        std::string name = DisplayName(korvread::FieldText(space->name));
+        const std::string key = KernelName(devicePath.c_str());
         if (!key.empty())
             names[key] = std::move(name);
     }
@@ -176,17 +172,16 @@ bool FillIn(Records &spaceIO, Json::Value &space)
     Records *total = nullptr;
     for (Json::ArrayIndex index = 0; index < spaceIO.size(); ++index) {
         Records &record = spaceIO[index];
-        if (!korvsnmp::IsRecord(record)) {
+        if (!korvread::IsRecord(record)) {
             KORVSNMP_LOG(LOG_ERR, "SpaceIO element %u is not an object", index);
             return false;
         }
-        const Json::Value *device = record.find(kDeviceKey, kDeviceKey + sizeof kDeviceKey - 1);
-        if (device != nullptr && !device->isString()) {
+        std::string deviceName;
+        if (!korvread::ReadDeviceName(record, deviceName)) {
             KORVSNMP_LOG(LOG_ERR, "SpaceIO element %u: \"%s\" is not a string", index,
                          kDeviceKey);
             return false;
         }
-        const std::string deviceName = device != nullptr ? device->asString() : std::string();
         if (deviceName == kTotalDevice) {
             total = &record;
             continue;
@@ -199,7 +194,7 @@ bool FillIn(Records &spaceIO, Json::Value &space)
         volumes.append(std::move(volume));
     }
 
-    if (!korvsnmp::IsRecord(space))
+    if (!korvread::IsRecord(space))
         space = Json::Value(Json::objectValue);
     if (total != nullptr)
         space[kTotalKey] = korvsnmp::Take(*total);

@@ -3,8 +3,8 @@
 #include <utility>
 
 #include <json/value.h>
+#include <korv_webapi.h>
 
-#include "korv_webapi.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
 #include "korvsnmp/fill_in_current_lun_io.h"
 #include "korvsnmp/fill_in_current_memory.h"

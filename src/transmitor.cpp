@@ -31,7 +31,7 @@ constexpr char kControlHostName[] = "localhost";
 
 // Closes the connection that `fd` holds, if any, and marks it closed: the
 // one place where the object's descriptor is closed.
-void CloseConnection(int &fd) { korvproto::UniqueFd(std::exchange(fd, -1)); }
+void CloseConnection(int &fd) { korvproto::UniqueFd(std::exchange(fd, -1)).Reset(); }
 
 // Closes the connection in `fd` when the scope ends, whether by return or by
 // an exception, unless KeepOpen() was called.

@@ -1,5 +1,5 @@
 // The collector control requests: their exact frames and the verdict on
-// every shape of reply.
+// every shape of reply; and the real collector socket, which no test touches.
 #include <fcntl.h>
 #include <spawn.h>
 #include <sys/socket.h>
@@ -11,6 +11,9 @@
 
 #include <cstring>
 #include <memory>
+#include <optional>
+#include <string>
+#include <vector>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -26,136 +29,106 @@ extern char **environ;
 
 namespace {
 
-using korvtest::Frame;
+using korvtest::Answer;
+
 using korvtest::Logged;
 using korvtest::LoggedMessages;
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
+using ::testing::Matcher;
 
 const char kUnit[] = "transmitor";
-const std::string kReloadText = "{\"request\":\"reload\"}";
+const char kReload[] = "{\"request\":\"reload\"}";
 
-class ControlRequestTest : public ::testing::Test {
-protected:
-    void SetUp() override { korvtest::ClearLog(); }
-};
+Matcher<korvtest::LogEntry> Error(const std::string &text) { return Logged(LOG_ERR, kUnit, text); }
 
-TEST_F(ControlRequestTest, ReloadPutsTwentySixBytesOnTheWire)
+std::string Refused(const std::string &reply)
 {
-    korvtest::TestCollector collector;
-    collector.Script({Frame("{\"success\":true}")});
-
-    EXPECT_TRUE(Transmitor::Reload());
-
-    ASSERT_TRUE(collector.WaitForConnections(1));
-    const std::string expected("\x00\x00\x00\x16{\"request\":\"reload\"}\n\x00", 26);
-    EXPECT_EQ(collector.Requests().at(0), expected);
-    EXPECT_THAT(LoggedMessages(), IsEmpty());
+    return std::string("Failed to send request: [") + kReload + "], result: [" + reply + "]";
 }
 
-TEST_F(ControlRequestTest, HistoryModePutsTheReasonBeforeTheRequest)
-{
-    korvtest::TestCollector collector;
-    collector.Script({Frame("{\"success\":true}")});
-    collector.Script({Frame("{\"success\":true}")});
-
-    EXPECT_TRUE(Transmitor::EnterHistoryMode("test"));
-    EXPECT_TRUE(Transmitor::EnterHistoryMode(""));
-
-    ASSERT_TRUE(collector.WaitForConnections(2));
-    const std::string test("\x00\x00\x00\x2c{\"reason\":\"test\",\"request\":\"history_mode\"}\n\x00", 48);
-    const std::string empty("\x00\x00\x00\x28{\"reason\":\"\",\"request\":\"history_mode\"}\n\x00", 44);
-    EXPECT_EQ(collector.Requests().at(0), test);
-    EXPECT_EQ(collector.Requests().at(1), empty);
-}
-
-struct RefusalCase {
+struct ControlCase {
     const char *name;
-    std::string reply;
-    std::string replyText;  // as the message renders it
+    const char *reason;          // EnterHistoryMode(reason); null: Reload()
+    std::optional<Answer> answer;  // none: no collector listens
+    bool accepted;
+    std::string request;         // the bytes on the wire
+    std::vector<Matcher<korvtest::LogEntry>> messages;
 };
 
-class ControlRefusalTest : public ControlRequestTest,
-                           public ::testing::WithParamInterface<RefusalCase> {};
+const std::string kReloadFrame("\x00\x00\x00\x16{\"request\":\"reload\"}\n\x00", 26);
 
-TEST_P(ControlRefusalTest, AnythingButBooleanTrueIsARefusal)
+Answer Reply(const std::string &body) { return {korvtest::Frame(body)}; }
+
+ControlCase Refusal(const char *name, const std::string &reply)
 {
-    korvtest::TestCollector collector;
-    collector.Script({Frame(GetParam().reply)});
+    return {name, nullptr, Reply(reply), false, kReloadFrame, {Error(Refused(reply))}};
+}
 
-    EXPECT_FALSE(Transmitor::Reload());
+void PrintTo(const ControlCase &c, std::ostream *out) { *out << c.name; }
 
-    EXPECT_THAT(LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, kUnit,
-                                   "Failed to send request: [" + kReloadText + "], result: [" +
-                                       GetParam().replyText + "]")));
+class ControlRequestTest : public ::testing::TestWithParam<ControlCase> {};
+
+TEST_P(ControlRequestTest, FrameVerdictAndMessages)
+{
+    const ControlCase &c = GetParam();
+    korvtest::ClearLog();
+    std::optional<korvtest::TestCollector> collector;
+    std::optional<korvtest::NoCollector> absent;
+    if (c.answer) {
+        collector.emplace();
+        collector->Script(*c.answer);
+    } else {
+        absent.emplace();
+    }
+
+    const bool accepted =
+        c.reason != nullptr ? Transmitor::EnterHistoryMode(c.reason) : Transmitor::Reload();
+
+    EXPECT_EQ(accepted, c.accepted);
+    EXPECT_THAT(LoggedMessages(), ::testing::ElementsAreArray(c.messages));
+    if (collector) {
+        ASSERT_TRUE(collector->WaitForConnections(1));
+        EXPECT_EQ(collector->Requests().at(0), c.request);
+    }
 }
 
 INSTANTIATE_TEST_SUITE_P(
-    Replies, ControlRefusalTest,
-    ::testing::Values(RefusalCase{"False", "{\"success\":false}", "{\"success\":false}"},
-                      RefusalCase{"NumberOne", "{\"success\":1}", "{\"success\":1}"},
-                      RefusalCase{"StringTrue", "{\"success\":\"true\"}", "{\"success\":\"true\"}"},
-                      RefusalCase{"Array", "[true]", "[true]"},
-                      RefusalCase{"NoSuccessMember", "{\"result\":true}", "{\"result\":true}"},
-                      RefusalCase{"Scalar", "true", "true"}),
+    Replies, ControlRequestTest,
+    ::testing::Values(
+        ControlCase{"Reload", nullptr, Reply("{\"success\":true}"), true, kReloadFrame, {}},
+        ControlCase{"HistoryModeReasonBeforeRequest", "test", Reply("{\"success\":true}"), true,
+                    std::string("\x00\x00\x00\x2c{\"reason\":\"test\",\"request\":\"history_mode\"}"
+                                "\n\x00", 48),
+                    {}},
+        ControlCase{"HistoryModeEmptyReason", "", Reply("{\"success\":true}"), true,
+                    std::string("\x00\x00\x00\x28{\"reason\":\"\",\"request\":\"history_mode\"}\n\x00",
+                                44),
+                    {}},
+        Refusal("False", "{\"success\":false}"), Refusal("NumberOne", "{\"success\":1}"),
+        Refusal("StringTrue", "{\"success\":\"true\"}"), Refusal("Array", "[true]"),
+        Refusal("NoSuccessMember", "{\"result\":true}"), Refusal("Scalar", "true"),
+        ControlCase{"EmptyReply", "backup", Reply(""), false,
+                    std::string("\x00\x00\x00\x2e{\"reason\":\"backup\",\"request\":\"history_mode\"}"
+                                "\n\x00", 50),
+                    {Error("Error: wrong member data inside"),
+                     Error("Failed to get response from korvsnmpcd, request: "
+                           "[{\"reason\":\"backup\",\"request\":\"history_mode\"}]")}},
+        ControlCase{"ReplyNotJson", nullptr, Reply("{\"success\":"), false, kReloadFrame,
+                    {::testing::Field(&korvtest::LogEntry::text,
+                                      ::testing::HasSubstr(" Error: cannot convert the string to "
+                                                           "json format * Line 1, Column 12")),
+                     Error(std::string("Failed to get response from korvsnmpcd, request: [") +
+                           kReload + "]")}},
+        ControlCase{"CollectorHangsUp", nullptr, Answer{""}, false, kReloadFrame,
+                    {Error("client Failed to read action"), Error("Error: cannot received the data"),
+                     Error(std::string("Failed to send request to korvsnmpcd, request: [") + kReload +
+                           "]")}},
+        ControlCase{"NoCollector", nullptr, std::nullopt, false, "",
+                    {Logged(LOG_INFO, "socket_init",
+                            "Failed to connect to socket: [/tmp/korvsnmpcd.sock], reason: "
+                            "[No such file or directory]"),
+                     Error(std::string("Failed to send request to korvsnmpcd, request: [") + kReload +
+                           "]")}}),
     [](const auto &info) { return std::string(info.param.name); });
-
-TEST_F(ControlRequestTest, EmptyReplyIsNoResponse)
-{
-    korvtest::TestCollector collector;
-    collector.Script({Frame("")});
-
-    EXPECT_FALSE(Transmitor::EnterHistoryMode("backup"));
-
-    EXPECT_THAT(LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, kUnit, "Error: wrong member data inside"),
-                            Logged(LOG_ERR, kUnit,
-                                   "Failed to get response from korvsnmpcd, request: "
-                                   "[{\"reason\":\"backup\",\"request\":\"history_mode\"}]")));
-}
-
-TEST_F(ControlRequestTest, ReplyThatIsNotJsonIsNoResponse)
-{
-    korvtest::TestCollector collector;
-    collector.Script({Frame("{\"success\":")});
-
-    EXPECT_FALSE(Transmitor::Reload());
-
-    auto messages = LoggedMessages();
-    ASSERT_EQ(messages.size(), 2u);
-    EXPECT_THAT(messages[0].text, ::testing::HasSubstr(" Error: cannot convert the string to json format "));
-    EXPECT_THAT(messages[1], Logged(LOG_ERR, kUnit,
-                                    "Failed to get response from korvsnmpcd, request: [" + kReloadText + "]"));
-}
-
-TEST_F(ControlRequestTest, NoCollectorIsASendFailureAfterTheConnectMessage)
-{
-    korvtest::NoCollector absent;
-
-    EXPECT_FALSE(Transmitor::Reload());
-
-    EXPECT_THAT(LoggedMessages(),
-                ElementsAre(Logged(LOG_INFO, "socket_init",
-                                   "Failed to connect to socket: [/tmp/korvsnmpcd.sock], reason: "
-                                   "[No such file or directory]"),
-                            Logged(LOG_ERR, kUnit,
-                                   "Failed to send request to korvsnmpcd, request: [" + kReloadText + "]")));
-}
-
-TEST_F(ControlRequestTest, CollectorHangingUpIsASendFailure)
-{
-    korvtest::TestCollector collector;
-    collector.Script({""});
-
-    EXPECT_FALSE(Transmitor::Reload());
-
-    EXPECT_THAT(LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, kUnit, "client Failed to read action"),
-                            Logged(LOG_ERR, kUnit, "Error: cannot received the data"),
-                            Logged(LOG_ERR, kUnit,
-                                   "Failed to send request to korvsnmpcd, request: [" + kReloadText + "]")));
-}
 
 sockaddr_un RealCollectorAddress()
 {
@@ -179,7 +152,7 @@ int RunExchangeTests()
 {
     std::string self = "/proc/self/exe";
     std::string filter =
-        "--gtest_filter=Transmitor*:ControlRequestTest.*:KorvsnmpStatProgram.*:WholeRoad*";
+        "--gtest_filter=Transmitor*:Replies/ControlRequestTest.*:KorvsnmpStatProgram.*:WholeRoad*";
     char *argv[] = {self.data(), filter.data(), nullptr};
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);

@@ -71,8 +71,9 @@ TEST_F(LunIOTest, RecordsAreNamedFromTheLunList)
 
 TEST_F(LunIOTest, RecordWithoutDeviceGetsTheEmptyText)
 {
-    ExpectRewritten(R"([{"read": 1}, null])",
-                    R"([{"uuid": "", "lun_name": "", "read": 1}, {"uuid": "", "lun_name": ""}])");
+    ExpectRewritten(R"([{"read": 1}, null, {"device": null}])",
+                    R"([{"uuid": "", "lun_name": "", "read": 1}, {"uuid": "", "lun_name": ""},
+                        {"uuid": "", "lun_name": ""}])");
     korvstandin::Host().luns = {{"", "nameless"}};
     ExpectRewritten(R"([{"read": 1}])", R"([{"uuid": "", "lun_name": "nameless", "read": 1}])");
 }
@@ -123,7 +124,7 @@ TEST_F(LunIOTest, UnreadableInputFailsAndStaysUntouched)
         {R"([{"device": "u-1"}, "u-2"])", "LunIO element 1 is not an object"},
         {R"([{"device": "u-1"}, {"device": 7}])", R"(LunIO element 1: "device" is not a string)"},
         {R"([{"device": {"uuid": "u-1"}}])", R"(LunIO element 0: "device" is not a string)"},
-        {R"([{"device": null}])", R"(LunIO element 0: "device" is not a string)"},
+        {R"([{"device": null}, {"device": false}])", R"(LunIO element 1: "device" is not a string)"},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.lunIO);

@@ -137,7 +137,7 @@ TEST_F(SpaceIONodeTest, SpaceDevicesAreNamedAndTheLastTotalKept)
     korvstandin::Host().spaces = {{Node(0), "Volume 1"}, {Node(1), "Volume 2"}, {Node(2), ""}};
     const Json::Value space = Fill(Parse("[" + Record(1, R"("r": 1, "display_name": "old")") +
                                          R"(, {"device": "total", "n": 1}, )" + Record(3) +
-                                         R"(, {"r": 9}, null, )" + Record(0) + ", " + Record(2) +
+                                         R"(, {"r": 9}, {"device": null}, null, )" + Record(0) + ", " + Record(2) +
                                          R"(, {"device": "Total"}, {"device": "total", "n": 2}, )" +
                                          Record(1, R"("r": 2)") + "]"));
     EXPECT_EQ(space, Parse(R"({"earlier": 1, "total": {"device": "total", "n": 2}, "volume": [)" +

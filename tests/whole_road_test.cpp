@@ -9,9 +9,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <json/reader.h>
-#include <json/writer.h>
-
 #include "block_nodes.h"
 #include "json_text.h"
 #include "korv_standin.h"

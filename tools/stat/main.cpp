@@ -1,22 +1,27 @@
 // korvsnmp-stat: what libkorvsnmp reports for this appliance, for operators
 // and scripts.
 #include <syslog.h>
+#include <unistd.h>
 
+#include <chrono>
 #include <iostream>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include "korvsnmp/korvsnmp.h"
+#include "openmetrics_format.h"
 #include "options.h"
 #include "protocol/collector_protocol.h"
 #include "table_format.h"
+#include "watch.h"
 
 namespace {
 
 constexpr int kExitFailure = 1;
 constexpr int kExitUsage = 2;
 constexpr char kHostName[] = "localhost";
+constexpr char kClearScreen[] = "\033[H\033[2J";
 
 int Fail(const std::string &what)
 {
@@ -33,11 +38,14 @@ Json::Value BuildRequest(const std::vector<std::string> &resources)
     return request;
 }
 
-void Print(const Json::Value &result, korvstat::Format format)
+void Print(const Json::Value &result, const korvstat::Options &options)
 {
-    switch (format) {
+    switch (options.format) {
     case korvstat::Format::Table:
-        korvstat::WriteTables(result, std::cout);
+        korvstat::WriteTables(result, options.rawNumbers, std::cout);
+        break;
+    case korvstat::Format::OpenMetrics:
+        korvstat::WriteOpenMetrics(result, std::cout);
         break;
     case korvstat::Format::CompactJson:
         std::cout << korvproto::CompactJson(result) << '\n';
@@ -61,8 +69,25 @@ int Statistics(const korvstat::Options &options)
     Json::Value result(Json::objectValue);
     if (!SNMPParseReplyData(request, std::move(reply), result))
         return Fail("the collector's reply could not be assembled into statistics");
-    Print(result, options.format);
+    Print(result, options);
     return 0;
+}
+
+// Statistics every --watch seconds, each on a cleared terminal.
+int WatchStatistics(const korvstat::Options &options)
+{
+    const bool terminal = isatty(STDOUT_FILENO) == 1;
+    const auto interval = std::chrono::milliseconds(static_cast<long>(options.watchSeconds * 1000));
+    return korvstat::Watch(
+        interval, options.watchCount,
+        [&] {
+            if (terminal)
+                std::cout << kClearScreen;
+            const int status = Statistics(options);
+            std::cout << std::flush;
+            return status;
+        },
+        korvstat::WaitUnlessInterrupted);
 }
 
 }  // namespace
@@ -82,6 +107,9 @@ int main(int argc, char **argv)
     case korvstat::Action::Help:
         std::cout << korvstat::kUsage;
         return 0;
+    case korvstat::Action::Version:
+        std::cout << "korvsnmp-stat " KORVSNMP_VERSION "\n";
+        return 0;
     case korvstat::Action::Reload:
         return Transmitor::Reload() ? 0 : Fail("the collector did not reload");
     case korvstat::Action::HistoryMode:
@@ -91,5 +119,5 @@ int main(int argc, char **argv)
     case korvstat::Action::Statistics:
         break;
     }
-    return Statistics(options);
+    return options.watchSeconds > 0 ? WatchStatistics(options) : Statistics(options);
 }

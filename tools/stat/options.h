@@ -7,20 +7,25 @@
 
 namespace korvstat {
 
-enum class Format { PrettyJson, CompactJson, Table };
-enum class Action { Statistics, Reload, HistoryMode, Help };
+enum class Format { PrettyJson, CompactJson, Table, OpenMetrics };
+enum class Action { Statistics, Reload, HistoryMode, Help, Version };
 
 struct Options {
     Action action = Action::Statistics;
     Format format = Format::PrettyJson;
     std::vector<std::string> resources{"all"};
-    std::string reason;  // HistoryMode
+    std::string reason;          // HistoryMode
+    bool rawNumbers = false;     // --bytes: tables show exact counts, not 1.5M
+    double watchSeconds = 0;     // --watch: redraw every so many seconds; 0: once
+    unsigned watchCount = 0;     // hidden --watch-count: stop after so many draws; 0: never
 };
 
 // The resource names that a request may carry.
 const std::vector<std::string> &KnownResources();
 
-// Parses argv[1..]. False with `error` set on a bad command line.
+// Parses argv[1..] (`--option value` and `--option=value` alike). False with
+// `error` saying what is wrong on an unknown, repeated, malformed or
+// conflicting option, or a stray operand; `options` is then unspecified.
 bool ParseOptions(const std::vector<std::string> &arguments, Options &options, std::string &error);
 
 extern const std::string kUsage;

@@ -1,9 +1,13 @@
 #include "table_format.h"
 
+#include <time.h>
+
 #include <algorithm>
+#include <cstdint>
 #include <string>
 #include <vector>
 
+#include "counters.h"
 #include "protocol/collector_protocol.h"
 
 namespace korvstat {
@@ -11,6 +15,7 @@ namespace {
 
 constexpr char kMissing[] = "-";
 constexpr char kColumnGap[] = "  ";
+constexpr char kTotal[] = "total";
 
 std::string CellText(const Json::Value &value)
 {
@@ -21,97 +26,138 @@ std::string CellText(const Json::Value &value)
     return korvproto::CompactJson(value);
 }
 
-using Row = std::vector<std::string>;
+struct Cell {
+    std::string text;
+    bool numeric = false;
+};
 
-// Prints `rows` under `header`, columns padded to their widest cell; columns
-// whose cells are all numbers are aligned right.
-void PrintGrid(const std::string &title, const Row &header, const std::vector<Row> &rows,
-               const std::vector<bool> &numeric, std::ostream &out)
+Cell CounterCell(const Json::Value &value, Unit unit, bool rawNumbers)
+{
+    double shown = 0;
+    if (!ShownValue(value, unit, shown))
+        return {CellText(value), false};
+    const bool bytes = unit == Unit::BytesPerSecond || unit == Unit::KiB;
+    return {bytes && !rawNumbers ? HumanBytes(shown) : ExactText(value, unit), true};
+}
+
+using Row = std::vector<Cell>;
+
+// Prints `rows` under `header`, columns padded to their widest cell; a
+// column whose cells are numbers (or missing) is aligned right.
+void PrintGrid(const std::string &title, const std::vector<std::string> &header,
+               const std::vector<Row> &rows, std::ostream &out)
 {
     std::vector<size_t> widths(header.size());
+    std::vector<bool> right(header.size(), !rows.empty());
     for (size_t c = 0; c < header.size(); ++c) {
         widths[c] = header[c].size();
-        for (const Row &row : rows)
-            widths[c] = std::max(widths[c], row[c].size());
+        for (const Row &row : rows) {
+            widths[c] = std::max(widths[c], row[c].text.size());
+            if (!row[c].numeric && row[c].text != kMissing)
+                right[c] = false;
+        }
     }
-    auto printRow = [&](const Row &row) {
+    auto printRow = [&](const std::vector<std::string> &cells) {
         std::string line;
-        for (size_t c = 0; c < row.size(); ++c) {
-            std::string padding(widths[c] - row[c].size(), ' ');
+        for (size_t c = 0; c < cells.size(); ++c) {
+            std::string padding(widths[c] - cells[c].size(), ' ');
             line += c == 0 ? "" : kColumnGap;
-            line += numeric[c] ? padding + row[c] : row[c] + padding;
+            line += right[c] ? padding + cells[c] : cells[c] + padding;
         }
         line.erase(line.find_last_not_of(' ') + 1);
         out << line << '\n';
     };
     out << title << '\n';
     printRow(header);
-    for (const Row &row : rows)
-        printRow(row);
+    for (const Row &row : rows) {
+        std::vector<std::string> cells;
+        for (const Cell &cell : row)
+            cells.push_back(cell.text);
+        printRow(cells);
+    }
     out << '\n';
 }
 
-// A table of records (objects): the `preferred` columns first, where any
-// record has them, then every other member in name order.
-void PrintRecords(const std::string &title, const std::vector<const Json::Value *> &records,
-                  const std::vector<std::string> &preferred, std::ostream &out)
+std::string Header(const Counter &counter)
+{
+    return std::string(counter.member) + " (" + HeaderUnit(counter.unit) + ")";
+}
+
+bool IsKnown(const std::string &name, const std::vector<std::string> &names,
+             const std::vector<Counter> &counters)
+{
+    return std::find(names.begin(), names.end(), name) != names.end() ||
+           std::any_of(counters.begin(), counters.end(),
+                       [&](const Counter &c) { return name == c.member; });
+}
+
+// A table of records: the `names` columns, every one of `counters`, then the
+// other members that any record has, by name.
+void PrintCounterTable(const std::string &title, const std::vector<const Json::Value *> &records,
+                       const std::vector<std::string> &names, const std::vector<Counter> &counters,
+                       bool rawNumbers, std::ostream &out)
 {
     if (records.empty()) {
         out << title << "\n(none)\n\n";
         return;
     }
     std::vector<std::string> others;
-    std::vector<bool> hasPreferred(preferred.size(), false);
     for (const Json::Value *record : records) {
         if (!record->isObject())
             continue;
-        for (const std::string &name : record->getMemberNames()) {
-            auto known = std::find(preferred.begin(), preferred.end(), name);
-            if (known != preferred.end())
-                hasPreferred[known - preferred.begin()] = true;
-            else if (std::find(others.begin(), others.end(), name) == others.end())
+        for (const std::string &name : record->getMemberNames())
+            if (!IsKnown(name, names, counters) &&
+                std::find(others.begin(), others.end(), name) == others.end())
                 others.push_back(name);
-        }
     }
     std::sort(others.begin(), others.end());
-    Row header;
-    for (size_t i = 0; i < preferred.size(); ++i)
-        if (hasPreferred[i])
-            header.push_back(preferred[i]);
+
+    std::vector<std::string> header = names;
+    for (const Counter &counter : counters)
+        header.push_back(Header(counter));
     header.insert(header.end(), others.begin(), others.end());
-    if (header.empty())
-        header.push_back("value");
 
     std::vector<Row> rows;
-    std::vector<bool> numeric(header.size(), !records.empty());
     for (const Json::Value *record : records) {
         Row row;
-        for (size_t c = 0; c < header.size(); ++c) {
-            const Json::Value *cell = record;
-            if (record->isObject())
-                cell = &(*record)[header[c]];
-            else if (c != 0)
-                cell = nullptr;
-            row.push_back(cell ? CellText(*cell) : kMissing);
-            if (cell && !cell->isNumeric())
-                numeric[c] = false;
+        if (!record->isObject()) {
+            row.push_back({CellText(*record), false});
+            row.resize(header.size(), Cell{kMissing, false});
+            rows.push_back(std::move(row));
+            continue;
+        }
+        for (const std::string &name : names)
+            row.push_back({CellText((*record)[name]), false});
+        for (const Counter &counter : counters)
+            row.push_back(CounterCell((*record)[counter.member], counter.unit, rawNumbers));
+        for (const std::string &name : others) {
+            const Json::Value &value = (*record)[name];
+            row.push_back({CellText(value), value.isNumeric()});
         }
         rows.push_back(std::move(row));
     }
-    PrintGrid(title, header, rows, numeric, out);
+    PrintGrid(title, header, rows, out);
 }
 
-// One record shown as member / value lines.
-void PrintRecord(const std::string &title, const Json::Value &record, std::ostream &out)
+// One record shown as one line per member: the known `counters` present,
+// in their order, then the others by name, their values as they are.
+void PrintMemberTable(const std::string &title, const std::string &nameHeader,
+                      const std::string &valueHeader, const Json::Value &record,
+                      const std::vector<Counter> &counters, bool rawNumbers, std::ostream &out)
 {
     std::vector<Row> rows;
     if (record.isObject()) {
+        for (const Counter &counter : counters)
+            if (record.isMember(counter.member))
+                rows.push_back({{counter.member, false},
+                                CounterCell(record[counter.member], counter.unit, rawNumbers)});
         for (const std::string &name : record.getMemberNames())
-            rows.push_back({name, CellText(record[name])});
+            if (!IsKnown(name, {}, counters))
+                rows.push_back({{name, false}, {CellText(record[name]), record[name].isNumeric()}});
     } else {
-        rows.push_back({"value", CellText(record)});
+        rows.push_back({{"value", false}, {CellText(record), false}});
     }
-    PrintGrid(title, {"member", "value"}, rows, {false, false}, out);
+    PrintGrid(title, {nameHeader, valueHeader}, rows, out);
 }
 
 std::vector<const Json::Value *> Elements(const Json::Value &array)
@@ -123,45 +169,70 @@ std::vector<const Json::Value *> Elements(const Json::Value &array)
     return elements;
 }
 
-// Sections that hold a list of records and a "total" object.
-std::vector<const Json::Value *> ListWithTotal(const Json::Value &section, const char *list)
+// The records of `section` with the "total" ones last: the member "total" of
+// an object that holds its records under `list`, or the records of an array
+// whose "device" is "total". Another value is one record of its own.
+std::vector<const Json::Value *> TotalLast(const Json::Value &section, const char *list)
 {
-    if (!section.isObject())
+    if (!section.isArray() && !(section.isObject() && *list != '\0'))
         return {&section};
-    std::vector<const Json::Value *> rows = Elements(section[list]);
-    if (section.isMember("total"))
-        rows.push_back(&section["total"]);
+    std::vector<const Json::Value *> rows = Elements(section.isObject() ? section[list] : section);
+    std::stable_partition(rows.begin(), rows.end(), [](const Json::Value *record) {
+        return !(record->isObject() && (*record)["device"] == kTotal);
+    });
+    if (section.isObject() && section.isMember(kTotal))
+        rows.push_back(&section[kTotal]);
     return rows;
+}
+
+// Seconds since the epoch as local ISO 8601 with the offset from UTC:
+// 2026-11-23T21:04:05+01:00. Other values as they are.
+std::string LocalTime(const Json::Value &time)
+{
+    if (!time.isIntegral() || !time.isInt64())
+        return CellText(time);
+    const time_t seconds = static_cast<time_t>(time.asInt64());
+    struct tm local {};
+    char text[64];
+    if (localtime_r(&seconds, &local) == nullptr ||
+        strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%S%z", &local) == 0)
+        return CellText(time);
+    std::string iso = text;
+    iso.insert(iso.size() - 2, ":");  // +0100 -> +01:00
+    return iso;
 }
 
 }  // namespace
 
-void WriteTables(const Json::Value &result, std::ostream &out)
+void WriteTables(const Json::Value &result, bool rawNumbers, std::ostream &out)
 {
     if (!result.isObject()) {
         out << CellText(result) << '\n';
         return;
     }
-    if (result.isMember("cpu"))
-        PrintRecord("CPU", result["cpu"], out);
-    if (result.isMember("memory"))
-        PrintRecord("Memory", result["memory"], out);
-    if (result.isMember("network"))
-        PrintRecords("Network interfaces", Elements(result["network"]), {"device", "rx", "tx"}, out);
-    if (result.isMember("disk"))
-        PrintRecords("Disks", ListWithTotal(result["disk"], "disk"),
-                     {"display_name", "type", "device", "utilization", "read_access", "read_byte",
-                      "write_access", "write_byte"},
-                     out);
-    if (result.isMember("space"))
-        PrintRecords("Volumes", ListWithTotal(result["space"], "volume"), {"display_name", "device"},
-                     out);
-    if (result.isMember("lun"))
-        PrintRecords("iSCSI LUNs", Elements(result["lun"]), {"lun_name", "uuid"}, out);
-    if (result.isMember("nfs"))
-        PrintRecord("NFS", result["nfs"], out);
     if (result.isMember("time"))
-        out << "Time" << kColumnGap << CellText(result["time"]) << '\n';
+        out << "Sample time" << kColumnGap << LocalTime(result["time"]) << "\n\n";
+    if (result.isMember("cpu"))
+        PrintMemberTable("CPU", "state", "share (%)", result["cpu"], CpuCounters(), rawNumbers, out);
+    if (result.isMember("memory"))
+        PrintMemberTable("Memory", "member", "size (B)", result["memory"], MemoryCounters(),
+                         rawNumbers, out);
+    if (result.isMember("network"))
+        PrintCounterTable("Network interfaces", TotalLast(result["network"], ""), {"device"},
+                          NetworkCounters(), rawNumbers, out);
+    if (result.isMember("disk"))
+        PrintCounterTable("Disks", TotalLast(result["disk"], "disk"),
+                          {"device", "display_name", "type"}, DeviceCounters(), rawNumbers, out);
+    if (result.isMember("space"))
+        PrintCounterTable("Volumes", TotalLast(result["space"], "volume"),
+                          {"device", "display_name"}, DeviceCounters(), rawNumbers, out);
+    if (result.isMember("lun"))
+        PrintCounterTable("iSCSI LUNs", Elements(result["lun"]), {"uuid", "lun_name"},
+                          DeviceCounters(), rawNumbers, out);
+    if (result.isMember("nfs")) {
+        const Json::Value &nfs = result["nfs"];
+        PrintCounterTable("NFS", {&nfs}, {}, NfsCounters(), rawNumbers, out);
+    }
 }
 
 }  // namespace korvstat

@@ -1,0 +1,488 @@
+// korvsnmp-agentx under Debian's snmpd, read with net-snmp's own client
+// tools, against the test collector: every object matches the library's
+// result for the same reply; the walk answers from the last snapshot while
+// the collector stalls; the collector goes away and comes back; snmpd
+// restarts and the subagent registers again.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <optional>
+#include <sstream>
+#include <thread>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <korvsnmp/korvsnmp.h>
+
+#include "json_text.h"
+#include "korv_standin.h"
+#include "test_collector.h"
+
+extern char **environ;
+
+namespace {
+
+namespace fs = std::filesystem;
+using Clock = std::chrono::steady_clock;
+
+constexpr auto kReadyBound = std::chrono::seconds(20);  // generous for the sanitizer build
+constexpr auto kPollGap = std::chrono::milliseconds(50);
+constexpr char kSnmpd[] = "/usr/sbin/snmpd";
+
+// A private directory, removed with everything in it.
+class ScratchDir {
+public:
+    ScratchDir()
+    {
+        char pattern[] = "/tmp/korvsnmp-agentx-test.XXXXXX";
+        path_ = mkdtemp(pattern) ? pattern : "";
+    }
+    ~ScratchDir()
+    {
+        std::error_code ignored;
+        if (!path_.empty())
+            fs::remove_all(path_, ignored);
+    }
+    const std::string &Path() const { return path_; }
+
+private:
+    std::string path_;
+};
+
+// A child process, stopped by its id (SIGTERM, then waited for).
+class Child {
+public:
+    // Runs `argv` with this process's environment plus `variables`
+    // ("NAME=value", taking the place of a variable of the same name).
+    Child(const std::vector<std::string> &argv, const std::string &output,
+          const std::vector<std::string> &variables = {})
+    {
+        std::vector<std::string> environment = variables;
+        for (char **variable = environ; *variable != nullptr; ++variable) {
+            const std::string entry = *variable;
+            const std::string name = entry.substr(0, entry.find('=') + 1);
+            bool replaced = false;
+            for (const std::string &own : variables)
+                replaced = replaced || own.compare(0, name.size(), name) == 0;
+            if (!replaced)
+                environment.push_back(entry);
+        }
+        std::vector<char *> envp;
+        for (std::string &entry : environment)
+            envp.push_back(entry.data());
+        envp.push_back(nullptr);
+        posix_spawn_file_actions_t actions;
+        posix_spawn_file_actions_init(&actions);
+        posix_spawn_file_actions_addopen(&actions, 1, output.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+        posix_spawn_file_actions_adddup2(&actions, 1, 2);
+        std::vector<char *> args;
+        for (const std::string &arg : argv)
+            args.push_back(const_cast<char *>(arg.c_str()));
+        args.push_back(nullptr);
+        if (posix_spawn(&pid_, args[0], &actions, nullptr, args.data(), envp.data()) != 0)
+            pid_ = -1;
+        posix_spawn_file_actions_destroy(&actions);
+    }
+    ~Child() { Stop(); }
+    Child(const Child &) = delete;
+    Child &operator=(const Child &) = delete;
+
+    pid_t Pid() const { return pid_; }
+    // Sends SIGTERM and waits; the exit status (-1: killed by a signal).
+    int Stop()
+    {
+        if (pid_ > 0) {
+            kill(pid_, SIGTERM);
+            int status = 0;
+            waitpid(pid_, &status, 0);
+            pid_ = -1;
+            status_ = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+        }
+        return status_;
+    }
+
+private:
+    pid_t pid_ = -1;
+    int status_ = -1;
+};
+
+uint16_t FreeUdpPort()
+{
+    int fd = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t length = sizeof address;
+    bind(fd, reinterpret_cast<sockaddr *>(&address), sizeof address);
+    getsockname(fd, reinterpret_cast<sockaddr *>(&address), &length);
+    close(fd);
+    return ntohs(address.sin_port);
+}
+
+// Runs a shell command; its standard output and error.
+std::string RunCommand(const std::string &command)
+{
+    std::string output;
+    if (FILE *pipe = popen((command + " 2>&1").c_str(), "r")) {
+        char buffer[4096];
+        for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+            output.append(buffer, n);
+        pclose(pipe);
+    }
+    return output;
+}
+
+std::string ReadFile(const std::string &path)
+{
+    std::ifstream in(path);
+    return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+}
+
+template <typename Predicate>
+bool PollUntil(Predicate done)
+{
+    for (auto end = Clock::now() + kReadyBound; Clock::now() < end;) {
+        if (done())
+            return true;
+        std::this_thread::sleep_for(kPollGap);
+    }
+    return done();
+}
+
+// Sockets on the test collector's path that are open now (listening socket
+// included), from the kernel's table.
+int CollectorSocketCount()
+{
+    const std::string &path = korvtest::PrivateCollectorPath();
+    std::istringstream table(ReadFile("/proc/net/unix"));
+    int count = 0;
+    for (std::string line; std::getline(table, line);)
+        count += line.size() > path.size() && line.compare(line.size() - path.size(), path.size(), path) == 0;
+    return count;
+}
+
+// A reply that names this host's own devices, which the stand-in platform
+// (describing this host) knows: its disks, interfaces and mounted devices.
+Json::Value LiveHostReply(unsigned time, unsigned seed)
+{
+    auto counters = [seed](Json::Value record, unsigned n) {
+        record["utilization"] = (seed + n) % 100;
+        record["read_access"] = seed * 3 + n;
+        record["read_byte"] = seed * 4096 + n;
+        record["write_access"] = seed * 5 + n;
+        record["write_byte"] = seed * 8192 + n;
+        return record;
+    };
+    auto device = [](const std::string &name) {
+        Json::Value record(Json::objectValue);
+        record["device"] = name;
+        return record;
+    };
+    Json::Value data(Json::objectValue);
+    data["System"].append(korvtest::ParseJson(
+        R"({"user": 11, "nice": 1, "system": 7, "idle": 70, "iowait": 5, "irq": 2, "softirq": 3, "steal": 1})"));
+    data["Memory"].append(korvtest::ParseJson(
+        R"({"total_real": 8000000, "avail_real": 6000000, "free_real": 4000000, "buffer": 1000,
+            "cached": 200000, "total_swap": 1048576, "avail_swap": 1000000})"));
+    unsigned n = 0;
+    data["Network"] = Json::Value(Json::arrayValue);
+    for (const auto &entry : fs::directory_iterator("/sys/class/net")) {
+        Json::Value record = device(entry.path().filename());
+        record["rx"] = seed * 1000 + ++n;
+        record["tx"] = seed * 2000 + n;
+        data["Network"].append(record);
+    }
+    data["DiskIO"] = Json::Value(Json::arrayValue);
+    for (const auto &entry : fs::directory_iterator("/sys/block"))
+        if (fs::exists(entry.path() / "device"))
+            data["DiskIO"].append(counters(device(entry.path().filename()), ++n));
+    data["SpaceIO"] = Json::Value(Json::arrayValue);
+    std::istringstream mounts(ReadFile("/proc/self/mounts"));
+    for (std::string source, rest; mounts >> source && std::getline(mounts, rest);) {
+        struct stat node;
+        if (stat(source.c_str(), &node) != 0 || !S_ISBLK(node.st_mode))
+            continue;
+        std::error_code error;
+        fs::path target = fs::read_symlink("/sys/dev/block/" + std::to_string(major(node.st_rdev)) +
+                                               ":" + std::to_string(minor(node.st_rdev)), error);
+        if (!error)
+            data["SpaceIO"].append(counters(device(target.filename()), ++n));
+    }
+    data["SpaceIO"].append(counters(device("total"), 0));
+    data["iSCSI"].append(counters(device("60014052-e000-4000-8000-000000000001"), ++n));
+    data["NFS"] = korvtest::ParseJson(R"({"calls": 40, "read_byte": 50, "write_byte": 60})");
+    data["time"] = time;
+    Json::Value reply;
+    reply["data"] = data;
+    return reply;
+}
+
+// What a walk with -Os -OQ -Oe -OU must show for the library's result of the
+// first sample (rows numbered from 1 in the result's order), the subagent's
+// own age and failure count left out.
+std::map<std::string, std::string> ExpectedObjects(const Json::Value &result)
+{
+    std::map<std::string, std::string> objects;
+    auto number = [](const Json::Value &value) { return std::to_string(value.asUInt64()); };
+    auto text = [](const Json::Value &value) { return value.asString(); };
+    auto scalars = [&](const char *section, std::initializer_list<std::pair<const char *, const char *>> names) {
+        for (const auto &[object, member] : names)
+            if (result[section].isMember(member))
+                objects[std::string(object) + ".0"] = number(result[section][member]);
+    };
+    objects["korvSampleTime.0"] = number(result["time"]);
+    objects["korvSampleInterval.0"] = "3600";
+    scalars("cpu", {{"korvCpuUser", "user"}, {"korvCpuNice", "nice"}, {"korvCpuSystem", "system"},
+                    {"korvCpuIdle", "idle"}, {"korvCpuIowait", "iowait"}, {"korvCpuIrq", "irq"},
+                    {"korvCpuSoftirq", "softirq"}, {"korvCpuSteal", "steal"}});
+    scalars("memory", {{"korvMemorySize", "memory_size"}, {"korvMemoryTotalReal", "total_real"},
+                       {"korvMemoryAvailReal", "avail_real"}, {"korvMemoryFreeReal", "free_real"},
+                       {"korvMemoryCached", "cached"}, {"korvMemoryBuffer", "buffer"},
+                       {"korvMemoryTotalSwap", "total_swap"}, {"korvMemoryAvailSwap", "avail_swap"}});
+    scalars("nfs", {{"korvNfsCalls", "calls"}, {"korvNfsReadByte", "read_byte"},
+                    {"korvNfsWriteByte", "write_byte"}});
+    const std::pair<const char *, const char *> counters[] = {
+        {"Utilization", "utilization"}, {"ReadAccess", "read_access"}, {"ReadByte", "read_byte"},
+        {"WriteAccess", "write_access"}, {"WriteByte", "write_byte"}};
+    for (const auto &[table, section, total] :
+         {std::tuple("korvDisk", "disk", "korvDiskTotal"), std::tuple("korvVolume", "space", "korvVolumeTotal")})
+        for (const auto &[suffix, member] : counters)
+            objects[std::string(total) + suffix + ".0"] = number(result[section]["total"][member]);
+    const std::map<std::string, int> diskTypes = {{"internal", 1}, {"ebox", 2}, {"usb", 3}, {"eSATA", 4}};
+    int row = 0;
+    for (const Json::Value &disk : result["disk"]["disk"]) {
+        const std::string index = "." + std::to_string(++row);
+        objects["korvDiskDevice" + index] = text(disk["device"]);
+        objects["korvDiskDisplayName" + index] = text(disk["display_name"]);
+        auto type = diskTypes.find(disk["type"].asString());
+        objects["korvDiskType" + index] = std::to_string(type == diskTypes.end() ? 5 : type->second);
+        for (const auto &[suffix, member] : counters)
+            objects["korvDisk" + std::string(suffix) + index] = number(disk[member]);
+    }
+    row = 0;
+    for (const Json::Value &volume : result["space"]["volume"]) {
+        const std::string index = "." + std::to_string(++row);
+        objects["korvVolumeDevice" + index] = text(volume["device"]);
+        objects["korvVolumeDisplayName" + index] = text(volume["display_name"]);
+        for (const auto &[suffix, member] : counters)
+            objects["korvVolume" + std::string(suffix) + index] = number(volume[member]);
+    }
+    row = 0;
+    for (const Json::Value &lun : result["lun"]) {
+        const std::string index = "." + std::to_string(++row);
+        objects["korvLunUuid" + index] = text(lun["uuid"]);
+        objects["korvLunName" + index] = text(lun["lun_name"]);
+        for (const auto &[suffix, member] : counters)
+            objects["korvLun" + std::string(suffix) + index] = number(lun[member]);
+    }
+    row = 0;
+    for (const Json::Value &interface : result["network"]) {
+        const std::string index = "." + std::to_string(++row);
+        objects["korvIfDevice" + index] = text(interface["device"]);
+        objects["korvIfKind" + index] = row == 1 ? "1" : "2";  // this host has no aggregation or PPPoE
+        objects["korvIfRx" + index] = number(interface["rx"]);
+        objects["korvIfTx" + index] = number(interface["tx"]);
+    }
+    return objects;
+}
+
+class AgentxUnderSnmpd : public ::testing::Test {
+protected:
+    void SetUp() override
+    {
+        ASSERT_FALSE(scratch_.Path().empty());
+        ASSERT_EQ(access(kSnmpd, X_OK), 0) << "snmpd is not installed";
+        port_ = FreeUdpPort();
+        agentxSocket_ = scratch_.Path() + "/agentx.sock";
+        std::ofstream(scratch_.Path() + "/snmpd.conf")
+            << "agentaddress udp:127.0.0.1:" << port_ << "\n"
+            << "master agentx\n"
+            << "agentXSocket " << agentxSocket_ << "\n"
+            << "agentXTimeout 1\n"
+            << "view korvview included .1.3.6.1.3.7947\n"
+            << "rocommunity public 127.0.0.1 -V korvview\n";
+        collector_.emplace();
+        StartSnmpd();
+    }
+
+    void StartSnmpd()
+    {
+        setenv("SNMP_PERSISTENT_DIR", (scratch_.Path() + "/snmpd-state").c_str(), 1);
+        snmpd_.emplace(std::vector<std::string>{kSnmpd, "-f", "-C", "-c", scratch_.Path() + "/snmpd.conf",
+                                                "-M", "", "-m", "", "-Lo"},
+                       scratch_.Path() + "/snmpd.out");
+        unsetenv("SNMP_PERSISTENT_DIR");
+        ASSERT_TRUE(PollUntil([&] { return fs::exists(agentxSocket_); }))
+            << ReadFile(scratch_.Path() + "/snmpd.out");
+    }
+
+    void StartSubagent()
+    {
+        subagent_.emplace(std::vector<std::string>{KORVSNMP_AGENTX_PATH, "--agentx-socket", agentxSocket_,
+                                                   "--interval", "3600", "--ping-interval", "1",
+                                                   "--persistent-dir", scratch_.Path() + "/agentx-state"},
+                          SubagentLog(), korvtest::RedirectedChildVariables());
+    }
+
+    std::string SubagentLog() const { return scratch_.Path() + "/agentx.out"; }
+
+    std::string Client(const std::string &tool, const std::string &arguments) const
+    {
+        return RunCommand(tool + " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB " +
+                   "-Os -OQ -Oe -OU 127.0.0.1:" + std::to_string(port_) + " " + arguments);
+    }
+
+    std::string Get(const std::string &object) const { return Client("snmpget", object); }
+
+    // Waits until the subagent answers from the sample of `time`.
+    bool WaitForSample(unsigned time)
+    {
+        const std::string expected = "korvSampleTime.0 = " + std::to_string(time) + "\n";
+        return PollUntil([&] { return Get("korvSampleTime.0") == expected; });
+    }
+
+    // Sends SIGHUP and waits until the subagent answers from the sample of `time`.
+    bool SampleNow(unsigned time)
+    {
+        kill(subagent_->Pid(), SIGHUP);
+        return WaitForSample(time);
+    }
+
+    // The library's result for `reply`, as this host's platform names it.
+    static Json::Value LibraryResult(const Json::Value &reply)
+    {
+        korvstandin::UseLiveHost();
+        Json::Value request, result;
+        request["resource"].append("all");
+        EXPECT_TRUE(SNMPParseReplyData(request, reply, result));
+        return result;
+    }
+
+    static std::map<std::string, std::string> Objects(const std::string &walk)
+    {
+        std::map<std::string, std::string> objects;
+        std::istringstream lines(walk);
+        for (std::string line; std::getline(lines, line);) {
+            size_t equals = line.find(" = ");
+            if (equals == std::string::npos)
+                objects["?" + line] = "";
+            else if (line.find(" = No more variables left in this MIB View", equals) == equals)
+                continue;  // the walk's end
+            else if (line.compare(0, 15, "korvSnapshotAge") != 0 && line.compare(0, 17, "korvFailedSamples") != 0)
+                objects[line.substr(0, equals)] = line.substr(equals + 3);
+        }
+        return objects;
+    }
+
+    ScratchDir scratch_;
+    uint16_t port_ = 0;
+    std::string agentxSocket_;
+    std::optional<korvtest::TestCollector> collector_;
+    std::optional<Child> snmpd_;
+    std::optional<Child> subagent_;  // declared last: stopped first
+};
+
+TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndTheEdgesOfTheSubtreeAnswerRight)
+{
+    const Json::Value reply = LiveHostReply(1795000000, 7);
+    collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
+    StartSubagent();  // it samples at once
+    ASSERT_TRUE(WaitForSample(1795000000)) << ReadFile(SubagentLog());
+
+    const std::string walk = Client("snmpwalk", "korvsnmpMIB");
+    EXPECT_THAT(Objects(walk), ::testing::ContainerEq(ExpectedObjects(LibraryResult(reply)))) << walk;
+    EXPECT_THAT(walk, ::testing::EndsWith(
+                          " = No more variables left in this MIB View (It is past the end of the MIB tree)\n"));
+    EXPECT_EQ(Client("snmpbulkwalk", "-Cr7 korvsnmpMIB"), walk);
+
+    const std::pair<std::string, std::string> edges[] = {
+        {"snmpget korvDiskDevice.999", "korvDiskDevice.999 = No Such Instance currently exists at this OID\n"},
+        {"snmpget korvObjects.99.0", "korvObjects.99.0 = No Such Object available on this agent at this OID\n"},
+        {"snmpgetnext korvLunWriteByte.1",
+         "korvLunWriteByte.1 = No more variables left in this MIB View (It is past the end of the MIB tree)\n"},
+        {"snmpgetnext korvLunTable.9", "korvLunTable.9 = No more variables left in this MIB View (It is past the end of the MIB tree)\n"},
+        {"snmpgetnext korvSampleTime", "korvSampleTime.0 = 1795000000\n"},
+    };
+    for (const auto &[command, expected] : edges) {
+        const size_t space = command.find(' ');
+        EXPECT_EQ(Client(command.substr(0, space), command.substr(space + 1)), expected) << command;
+    }
+
+    EXPECT_EQ(subagent_->Stop(), 0) << ReadFile(SubagentLog());
+    EXPECT_THAT(Client("snmpwalk", "korvsnmpMIB"), ::testing::HasSubstr("No more variables left"));
+}
+
+TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCountedAndLoggedOnce)
+{
+    collector_->Script({korvtest::Frame(korvtest::JsonText(LiveHostReply(1795000000, 1)))});
+    StartSubagent();  // it samples at once
+    ASSERT_TRUE(WaitForSample(1795000000)) << ReadFile(SubagentLog());
+    const std::string before = Client("snmpwalk", "korvsnmpMIB");
+
+    // The collector takes the request and holds the answer: the sampler waits
+    // in the library, the walk answers from the previous snapshot at once.
+    collector_->Script({"", false});
+    const int idle = CollectorSocketCount();
+    kill(subagent_->Pid(), SIGHUP);
+    ASSERT_TRUE(PollUntil([&] { return CollectorSocketCount() > idle; }));
+    const auto start = Clock::now();
+    const std::string during = Client("snmpbulkwalk", "korvsnmpMIB");
+    EXPECT_LT(Clock::now() - start, std::chrono::seconds(1));
+    EXPECT_EQ(Objects(during), Objects(before));
+
+    // Gone: the held exchange fails, then one more sample fails.
+    collector_.reset();
+    std::optional<korvtest::NoCollector> none(std::in_place);
+    ASSERT_TRUE(PollUntil([&] { return Get("korvFailedSamples.0") == "korvFailedSamples.0 = 1\n"; }));
+    kill(subagent_->Pid(), SIGHUP);
+    ASSERT_TRUE(PollUntil([&] { return Get("korvFailedSamples.0") == "korvFailedSamples.0 = 2\n"; }));
+    EXPECT_EQ(Objects(Client("snmpwalk", "korvsnmpMIB")), Objects(before));
+
+    // Back, with a reply that lacks the disks: their table empties.
+    none.reset();
+    collector_.emplace();
+    Json::Value reply = LiveHostReply(1795000060, 2);
+    reply["data"].removeMember("DiskIO");
+    collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
+    ASSERT_TRUE(SampleNow(1795000060)) << ReadFile(SubagentLog());
+    EXPECT_EQ(Client("snmpgetnext", "korvDiskTotal korvDiskTable"),
+              "korvIfDevice.1 = total\nkorvIfDevice.1 = total\n");
+
+    const std::string log = ReadFile(SubagentLog());
+    auto count = [&log](const std::string &text) {
+        size_t n = 0;
+        for (size_t at = log.find(text); at != std::string::npos; at = log.find(text, at + 1))
+            ++n;
+        return n;
+    };
+    EXPECT_EQ(count("No statistics from the collector; answering from the last sample"), 1u) << log;
+    EXPECT_EQ(count("The collector answers again"), 1u) << log;
+}
+
+TEST_F(AgentxUnderSnmpd, ARestartedSnmpdFindsTheSubagentRegisteredAgain)
+{
+    collector_->Script({korvtest::Frame(korvtest::JsonText(LiveHostReply(1795000000, 3)))});
+    StartSubagent();  // it samples at once
+    ASSERT_TRUE(WaitForSample(1795000000)) << ReadFile(SubagentLog());
+
+    snmpd_.reset();
+    StartSnmpd();
+    EXPECT_TRUE(PollUntil([&] { return Get("korvSampleTime.0") == "korvSampleTime.0 = 1795000000\n"; }))
+        << ReadFile(SubagentLog());
+    EXPECT_EQ(subagent_->Stop(), 0) << ReadFile(SubagentLog());
+}
+
+}  // namespace

@@ -1,0 +1,79 @@
+#!/bin/sh
+# Builds the Debian packages of a build tree with CPack, checks their
+# contents, dependencies and lintian, unpacks them into a throwaway root and
+# runs the unpacked korvsnmp-stat.
+# Usage: package_test.sh <build dir>
+set -eu
+build=$(cd "$1" && pwd)
+work=$(mktemp -d /tmp/korvsnmp-packages-XXXXXX)
+trap 'rm -rf "$work"' EXIT
+fail() { echo "FAIL: $*"; exit 1; }
+
+(cd "$build" && cpack -G DEB -B "$work/out" >"$work/cpack.log" 2>&1) ||
+    { cat "$work/cpack.log"; fail "cpack -G DEB"; }
+version=$(dpkg-deb -f "$work"/out/libkorvsnmp1_*.deb Version)
+deb() { echo "$work"/out/"$1"_"$version"_*.deb; }
+
+# Every install rule belongs to a package.
+cmake --install "$build" --component Unspecified --prefix "$work/unspecified" >/dev/null
+[ -z "$(find "$work/unspecified" -type f 2>/dev/null)" ] ||
+    fail "install rules without a COMPONENT: $(find "$work/unspecified" -type f)"
+
+# contents: <package> <path> present (+) or absent (-)
+while read -r package sign path; do
+    listing=$(dpkg-deb -c "$(deb "$package")" | awk '{print $6}')
+    found=no
+    echo "$listing" | grep -qxF ".$path" && found=yes
+    case "$sign$found" in
+    +no) fail "$package lacks $path" ;;
+    -yes) fail "$package holds $path" ;;
+    esac
+done <<'LIST'
+libkorvsnmp1 + /usr/lib/libkorvsnmp.so.1
+libkorvsnmp1 + /usr/lib/libkorvplatform.so.1
+libkorvsnmp1 - /usr/lib/libkorvsnmp.so
+libkorvsnmp1 + /usr/share/doc/libkorvsnmp1/copyright
+libkorvsnmp-dev + /usr/lib/libkorvsnmp.so
+libkorvsnmp-dev + /usr/include/korvsnmp/korvsnmp.h
+libkorvsnmp-dev + /usr/include/korvplatform/korv_platform.h
+libkorvsnmp-dev - /usr/include/korvplatform/standin/korv_standin.h
+libkorvsnmp-dev + /usr/lib/pkgconfig/korvsnmp.pc
+libkorvsnmp-dev + /usr/lib/cmake/korvsnmp/korvsnmpConfig.cmake
+libkorvsnmp-dev - /usr/lib/libkorvsnmp.so.1
+korvsnmp-tools + /usr/bin/korvsnmp-stat
+korvsnmp-tools + /usr/bin/korvsnmpcd
+korvsnmp-tools + /usr/share/man/man1/korvsnmp-stat.1.gz
+korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
+LIST
+
+# dependencies: on each other at the exact version, on jsoncpp from dpkg-shlibdeps
+depends() { dpkg-deb -f "$(deb "$1")" Depends; }
+for package in libkorvsnmp-dev korvsnmp-tools; do
+    depends $package | grep -q "libkorvsnmp1 (= $version)" || fail "$package: Depends: $(depends $package)"
+done
+for package in libkorvsnmp1 korvsnmp-tools; do
+    depends $package | grep -q "libjsoncpp25" || fail "$package: no shlibs dependency: $(depends $package)"
+done
+depends libkorvsnmp-dev | grep -q "libjsoncpp-dev" || fail "libkorvsnmp-dev needs libjsoncpp-dev"
+
+# lintian: no error and no warning, but for these, with their reasons:
+#   initial-upload-closes-no-bugs: the packages go to no Debian archive;
+#   no-manual-page: korvsnmpcd's page comes with the collector's service work.
+lintian --fail-on error,warning --suppress-tags initial-upload-closes-no-bugs,no-manual-page \
+    "$work"/out/*.deb >"$work/lintian.log" 2>&1 || { cat "$work/lintian.log"; fail "lintian"; }
+
+# The unpacked programs run from the throwaway root, with its libraries.
+for package in libkorvsnmp1 korvsnmp-tools; do
+    dpkg -x "$(deb $package)" "$work/root"
+done
+stat="$work/root/usr/bin/korvsnmp-stat"
+readelf -d "$stat" | grep -q 'R.*PATH' && fail "the packaged korvsnmp-stat has an RPATH"
+out=$(LD_LIBRARY_PATH="$work/root/usr/lib" "$stat" --version)
+[ "$out" = "korvsnmp-stat ${version%-*}" ] || fail "--version said: $out"
+LD_LIBRARY_PATH="$work/root/usr/lib" "$stat" --help | head -1 | grep -q '^Usage: korvsnmp-stat' ||
+    fail "--help"
+LD_LIBRARY_PATH="$work/root/usr/lib" ldd "$stat" | grep libkorvsnmp.so.1 | grep -q "$work/root" ||
+    fail "korvsnmp-stat does not use the unpacked library"
+zcat "$work/root/usr/share/man/man1/korvsnmp-stat.1.gz" | mandoc -T lint -W warning ||
+    fail "the packaged man page"
+echo "packages: $(cd "$work/out" && ls ./*.deb | tr '\n' ' ')"

@@ -1,0 +1,73 @@
+// korvsnmp-agentx's command line.
+#include "agentx_options.h"
+
+#include <cerrno>
+#include <cstdlib>
+
+namespace korvagentx {
+
+namespace {
+
+constexpr uint32_t kMaxSeconds = 86400;
+
+bool ParseSeconds(const std::string &text, uint32_t &seconds)
+{
+    if (text.empty() || text.find_first_not_of("0123456789") != std::string::npos)
+        return false;
+    errno = 0;
+    unsigned long long value = std::strtoull(text.c_str(), nullptr, 10);
+    if (errno != 0 || value < 1 || value > kMaxSeconds)
+        return false;
+    seconds = static_cast<uint32_t>(value);
+    return true;
+}
+
+}  // namespace
+
+const char kUsage[] =
+    "Usage: korvsnmp-agentx [--agentx-socket PATH] [--interval SECONDS]\n"
+    "                       [--ping-interval SECONDS] [--persistent-dir DIR]\n"
+    "\n"
+    "An AgentX subagent that serves KORVSNMP-MIB from libkorvsnmp's statistics.\n"
+    "  --agentx-socket PATH     the master agent's AgentX socket (/var/agentx/master)\n"
+    "  --interval SECONDS       time between samples, 1-86400 (5)\n"
+    "  --ping-interval SECONDS  how often the master is pinged, to find a restarted\n"
+    "                           one again, 1-86400 (5)\n"
+    "  --persistent-dir DIR     net-snmp's state directory (/var/lib/korvsnmp-agentx)\n"
+    "SIGHUP takes a sample at once; SIGTERM or SIGINT stops it.\n";
+
+bool ParseOptions(const std::vector<std::string> &arguments, Options &options, std::string &error)
+{
+    for (size_t i = 0; i < arguments.size(); ++i) {
+        const std::string &argument = arguments[i];
+        if (argument == "-h" || argument == "--help") {
+            options.help = true;
+            continue;
+        }
+        const bool takesValue = argument == "--agentx-socket" || argument == "--interval" ||
+                                argument == "--ping-interval" || argument == "--persistent-dir";
+        if (!takesValue) {
+            error = "unknown argument \"" + argument + "\"";
+            return false;
+        }
+        if (i + 1 == arguments.size()) {
+            error = argument + " needs a value";
+            return false;
+        }
+        const std::string &value = arguments[++i];
+        if (argument == "--agentx-socket" || argument == "--persistent-dir") {
+            if (value.empty()) {
+                error = argument + " needs a non-empty value";
+                return false;
+            }
+            (argument == "--agentx-socket" ? options.agentxSocket : options.persistentDir) = value;
+        } else if (!ParseSeconds(value, argument == "--interval" ? options.intervalSeconds
+                                                                 : options.pingSeconds)) {
+            error = argument + " wants whole seconds from 1 to 86400, not \"" + value + "\"";
+            return false;
+        }
+    }
+    return true;
+}
+
+}  // namespace korvagentx
