@@ -31,7 +31,7 @@ constexpr auto kSettleWait = std::chrono::seconds(10);
 constexpr auto kProbeLimit = milliseconds(5000);
 // Generous for a loaded two-core machine and the sanitizer build; a daemon
 // that leaves requests in the backlog behind the crowd takes seconds.
-constexpr auto kProbeP99Bound = milliseconds(500);
+constexpr auto kProbeP99Bound = milliseconds(1000);
 constexpr size_t kDescriptorSlack = 16;
 
 std::string SocketPath(const char *tag)
