@@ -122,12 +122,16 @@ TEST(AgentxSnapshot, MissingOrMisshapenSectionsGiveNoObjectsAndNeverThrow)
     }
 }
 
-TEST(AgentxSnapshot, RowsWithoutANameKeepTheirOtherCells)
+TEST(AgentxSnapshot, RowsWithoutANameKeepTheirOtherCellsAndLongNamesAreCut)
 {
     TableIndexes indexes;
-    Snapshot snapshot = Build(R"({"network": [{"device": 5, "rx": 1}, {"rx": 2}]})", indexes);
+    const std::string name(300, 'v');
+    Snapshot snapshot = Build(R"({"network": [{"device": 5, "rx": 1}, {"rx": 2}],
+                                  "space": {"volume": [{"display_name": ")" + name + R"("}]}})",
+                              indexes);
     std::vector<std::string> expected = kAgentScalarsWithoutTime;
-    expected.insert(expected.end(), {"7.1.3.1 = 2", "7.1.3.2 = 2", "7.1.4.1 = 1", "7.1.4.2 = 2"});
+    expected.insert(expected.end(), {"7.1.3.1 = 2", "7.1.3.2 = 2", "7.1.4.1 = 1", "7.1.4.2 = 2",
+                                     "9.1.3.1 = \"" + name.substr(0, 255) + "\""});
     EXPECT_THAT(Lines(snapshot), ::testing::ElementsAreArray(expected));
 }
 

@@ -10,8 +10,9 @@
 #include <gtest/gtest.h>
 
 #include "korv_standin.h"
+#include "platform_test.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
-#include "nothrow_allocation.h"
+#include "allocation_failure.h"
 #include "syslog_capture.h"
 
 namespace {
@@ -25,73 +26,62 @@ using ::testing::IsEmpty;
 
 constexpr char kUnit[] = "fill_in_current_disk_io";
 
-class DiskFixture : public ::testing::Test {
+// The names that the disk section gives `devices`, each as
+// "device=display_name/type".
+std::vector<std::string> Names(const std::vector<std::string> &devices)
+{
+    Json::Value diskIO(Json::arrayValue);
+    for (const std::string &device : devices)
+        diskIO.append(Json::Value(Json::objectValue))["device"] = device;
+    Json::Value out;
+    EXPECT_TRUE(KORVSNMP::FillInCurrentDiskIO(diskIO, out));
+    std::vector<std::string> names;
+    for (const Json::Value &disk : out["disk"])
+        names.push_back(disk["device"].asString() + "=" + disk["display_name"].asString() + "/" +
+                        disk["type"].asString());
+    return names;
+}
+
+void AddUnit(unsigned int number, std::vector<std::string> paths, std::optional<std::string> model,
+             bool powered = true)
+{
+    Host().supportsEBox = true;
+    Host().expansionUnits.push_back({number, std::move(paths), std::move(model), powered});
+}
+
+class DiskFixture : public korvtest::PlatformTest {
 protected:
-    void SetUp() override
-    {
-        korvstandin::Reset();
-        korvtest::ClearLog();
-        LoadStrings();
-    }
-    void TearDown() override { EXPECT_EQ(korvstandin::OutstandingAllocations(), 0); }
 
-    static void LoadStrings()
-    {
-        Host().files[korvstandin::kStringsFilePath]["volume"] = {
-            {"volume_disk", "Disk"},
-            {"volume_expansion", "Expansion Unit"},
-            {"dedicated_ssd_cache", "SSD Cache"}};
-    }
-
-    // One record per device; the names given as "device=display_name/type".
-    static std::vector<std::string> Names(const std::vector<std::string> &devices)
-    {
-        Json::Value diskIO(Json::arrayValue);
-        for (const std::string &device : devices)
-            diskIO.append(Json::Value(Json::objectValue))["device"] = device;
-        Json::Value out;
-        EXPECT_TRUE(KORVSNMP::FillInCurrentDiskIO(diskIO, out));
-        std::vector<std::string> names;
-        for (const Json::Value &disk : out["disk"])
-            names.push_back(disk["device"].asString() + "=" + disk["display_name"].asString() +
-                            "/" + disk["type"].asString());
-        return names;
-    }
-
-    static void AddUnit(unsigned int number, std::vector<std::string> paths,
-                        std::optional<std::string> model, bool powered = true)
-    {
-        Host().supportsEBox = true;
-        Host().expansionUnits.push_back({number, std::move(paths), std::move(model), powered});
-    }
 };
 
 using DiskInternalNames = DiskFixture;
 using DiskExternalNames = DiskFixture;
 using DiskIORecords = DiskFixture;
 
-TEST_F(DiskInternalNames, ExpansionUnitDiskNamesItsPoweredUnit)
+struct UnitCase {
+    std::optional<std::string> model;
+    bool powered;
+    const char *name;
+};
+
+class DiskUnitNames : public korvtest::PlatformTestWithParam<UnitCase> {};
+
+TEST_P(DiskUnitNames, ExpansionUnitDiskNamesItsPoweredUnit)
 {
-    struct Case {
-        std::optional<std::string> model;
-        bool powered;
-        const char *name;
-    } cases[] = {
-        {"Korvel-X5", true, "sdc=Disk 3 (X5-2)/ebox"},
-        {"X5", true, "sdc=Disk 3 (X5-2)/ebox"},
-        {"Korvel-X5", false, "sdc=Disk 3 (Expansion Unit)/ebox"},
-        {std::nullopt, true, "sdc=Disk 3 (Expansion Unit)/ebox"},
-        // Cut to 31 characters before the prefix is dropped.
-        {"Korvel-ABCDEFGHIJKLMNOPQRSTUVWXYZ", true, "sdc=Disk 3 (ABCDEFGHIJKLMNOPQRSTUVWX)/ebox"},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
-        SetUp();
-        Host().disks = {{3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"}};
-        AddUnit(2, {"/dev/sdc"}, c.model, c.powered);
-        EXPECT_THAT(Names({"sdc"}), ElementsAre(c.name));
-    }
+    Host().disks = {{3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"}};
+    AddUnit(2, {"/dev/sdc"}, GetParam().model, GetParam().powered);
+    EXPECT_THAT(Names({"sdc"}), ElementsAre(GetParam().name));
 }
+
+INSTANTIATE_TEST_SUITE_P(
+    Units, DiskUnitNames,
+    ::testing::Values(UnitCase{"Korvel-X5", true, "sdc=Disk 3 (X5-2)/ebox"},
+                      UnitCase{"X5", true, "sdc=Disk 3 (X5-2)/ebox"},
+                      UnitCase{"Korvel-X5", false, "sdc=Disk 3 (Expansion Unit)/ebox"},
+                      UnitCase{std::nullopt, true, "sdc=Disk 3 (Expansion Unit)/ebox"},
+                      // Cut to 31 characters before the prefix is dropped.
+                      UnitCase{"Korvel-ABCDEFGHIJKLMNOPQRSTUVWXYZ", true,
+                               "sdc=Disk 3 (ABCDEFGHIJKLMNOPQRSTUVWX)/ebox"}));
 
 TEST_F(DiskInternalNames, FirstPoweredUnitListingTheDiskWins)
 {
@@ -122,7 +112,6 @@ TEST_F(DiskInternalNames, InternalAndSsdCacheNamesAndDeviceKeys)
 
 TEST_F(DiskInternalNames, BadContainersAndTextsReadAnewForEveryDisk)
 {
-    korvstandin::SetJournal(true);
     Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"},
                     {1, 3, 0, "/dev/sda"},
                     {4, 4, 0, "/dev/sdd"}};
@@ -130,20 +119,8 @@ TEST_F(DiskInternalNames, BadContainersAndTextsReadAnewForEveryDisk)
     EXPECT_THAT(korvtest::LoggedMessages(),
                 ElementsAre(Logged(LOG_ERR, kUnit, "bad container: 3")));
 
-    const std::string file =
-        std::string("KLIBCFileGetSectionValue(") + korvstandin::kStringsFilePath;
-    std::vector<std::string> expected = {"KLIBCIsQuillbox()", "DiskInfoEnum(35)"};
-    for (int disk = 0; disk < 2; ++disk)
-        expected.insert(expected.end(), {"KLIBCSzHashAlloc(1024)",
-                                         file + ", volume, volume_disk, 256)",
-                                         file + ", volume, volume_expansion, 256)",
-                                         file + ", volume, dedicated_ssd_cache, 256)"});
-    std::vector<std::string> calls;
-    for (const std::string &call : korvstandin::Journal())
-        if (call.rfind("KLIBCSzHashAlloc", 0) == 0 || call.rfind("KLIBCFileGet", 0) == 0 ||
-            call.rfind("KLIBCIsQ", 0) == 0 || call.rfind("DiskInfoEnum(", 0) == 0)
-            calls.push_back(call);
-    EXPECT_EQ(calls, expected);
+    EXPECT_EQ(korvstandin::CallCount(Op::KLIBCSzHashAlloc), 2);
+    EXPECT_EQ(korvstandin::CallCount(Op::KLIBCFileGetSectionValue), 6);
     EXPECT_EQ(korvstandin::CallCount(Op::KLIBCSzHashFree), 2);
 }
 
@@ -161,48 +138,6 @@ TEST_F(DiskInternalNames, MissingTextsReadAsEmpty)
                             missing("dedicated_ssd_cache"), missing("volume_disk"),
                             missing("volume_expansion"), missing("dedicated_ssd_cache")));
 
-    korvtest::ClearLog();
-    LoadStrings();
-    korvstandin::SetFault(Op::KLIBCSzHashAlloc);
-    EXPECT_THAT(Names({"sda"}), ElementsAre("sda= 1/internal"));
-    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
-
-    korvstandin::SetFault(Op::KLIBCSzHashAlloc, Fault::None);
-    korvstandin::SetFault(Op::KLIBCSzHashSetValue, Fault::Fail, 0xAB);
-    Host().disks.resize(1);
-    korvtest::ClearLog();
-    EXPECT_THAT(Names({"sda"}), ElementsAre("sda= 1/internal"));
-    EXPECT_THAT(korvtest::LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, kUnit, "KLIBCSzHashSetValue failed[0x00AB standin:4]"),
-                            ::testing::_, ::testing::_));
-}
-
-TEST_F(DiskInternalNames, FailedEnumerationsReleaseWhatTheyHandedOut)
-{
-    Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}};
-    AddUnit(1, {"/dev/sdc"}, "X5");
-    struct Case {
-        Op op;
-        Fault fault;
-        const char *message;
-    } cases[] = {{Op::DiskInfoEnum, Fault::Fail, "Failed to enum disks"},
-                 {Op::DiskInfoEnum, Fault::FailLeavingList, "Failed to enum disks"},
-                 {Op::KORVEBoxInfoEnum, Fault::Fail, "Failed to enum ebox"},
-                 {Op::KORVEBoxInfoEnum, Fault::FailLeavingList, "Failed to enum ebox"}};
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.message);
-        korvtest::ClearLog();
-        korvstandin::SetFault(Op::DiskInfoEnum, Fault::None);
-        korvstandin::SetFault(c.op, c.fault);
-        Json::Value diskIO(Json::arrayValue), out(Json::objectValue);
-        out["keep"] = 1;
-        const Json::Value before = out;
-        EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(diskIO, out));
-        EXPECT_EQ(out, before);
-        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
-        EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
-    }
-    EXPECT_EQ(korvstandin::CallCount(Op::KORVUSBDevEnum), 0);
 }
 
 TEST_F(DiskInternalNames, UnitsWithoutWrapperAreNotSearched)
@@ -254,43 +189,46 @@ TEST_F(DiskExternalNames, QuillboxNamesOnlyExternalDevices)
     EXPECT_EQ(korvstandin::CallCount(Op::DiskInfoEnum), 0);
 }
 
-TEST_F(DiskExternalNames, FailuresEndTheCallAndReleaseTheBlock)
+struct ExternalFailure {
+    const char *name;
+    void (*arrange)(korvstandin::HostDescription &host);  // null: the block cannot be allocated
+    const char *message;
+    int deviceListCalls;  // KORVUSBDevEnum calls before the pass ends
+};
+
+class DiskExternalFailure : public korvtest::PlatformTestWithParam<ExternalFailure> {};
+
+TEST_P(DiskExternalFailure, EndsTheCallAndReleasesTheBlock)
 {
     Host().quillbox = true;
     Host().usb.devices = {{"sdu", "USB"}};
-    struct Case {
-        void (*arrange)();
-        const char *message;
-        int esataCalls;
-    } cases[] = {
-        {[] { Host().usb.sizeQueryFails = true; },
-         "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE", 0},
-        {[] { Host().esata.sizeQueryFails = true; },
-         "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE", 1},
-        {[] { Host().usb.fillFails = true; }, "KORVExternalDevEnum: Error KORVUSBDevEnum", 0},
-        {[] { Host().esata.fillFails = true; }, "KORVExternalDevEnum: Error KORVUSBDevEnum", 2},
-        {nullptr, "KORVExternalDevEnum error: Out of Memory", 0},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.message);
-        SetUp();
-        Host().quillbox = true;
-        Host().usb.devices = {{"sdu", "USB"}};
-        korvstandin::SetJournal(true);
-        if (c.arrange != nullptr)
-            c.arrange();
-        korvtest::NothrowAllocationFailure usbBlock(c.arrange == nullptr ? 1 : 0);
-        Json::Value diskIO(Json::arrayValue), out;
-        diskIO.append(Json::Value(Json::objectValue))["device"] = "sdu";
-        EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(diskIO, out));
-        EXPECT_TRUE(out.isNull());
-        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
-        int esataCalls = 0;
-        for (const std::string &call : korvstandin::Journal())
-            esataCalls += call.rfind("KORVUSBDevEnum(16", 0) == 0;
-        EXPECT_EQ(esataCalls, c.esataCalls);
-    }
+    if (GetParam().arrange != nullptr)
+        GetParam().arrange(Host());
+    korvtest::NothrowAllocationFailure usbBlock(GetParam().arrange == nullptr ? 1 : 0);
+    Json::Value diskIO(Json::arrayValue), out;
+    diskIO.append(Json::Value(Json::objectValue))["device"] = "sdu";
+    EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(diskIO, out));
+    EXPECT_TRUE(out.isNull());
+    EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, GetParam().message)));
+    EXPECT_EQ(korvstandin::CallCount(Op::KORVUSBDevEnum), GetParam().deviceListCalls);
 }
+
+INSTANTIATE_TEST_SUITE_P(
+    Failures, DiskExternalFailure,
+    ::testing::Values(
+        ExternalFailure{"UsbSize", [](korvstandin::HostDescription &host) { host.usb.sizeQueryFails = true; },
+                        "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE", 1},
+        ExternalFailure{"EsataSize",
+                        [](korvstandin::HostDescription &host) { host.esata.sizeQueryFails = true; },
+                        "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE", 3},
+        ExternalFailure{"UsbFill", [](korvstandin::HostDescription &host) { host.usb.fillFails = true; },
+                        "KORVExternalDevEnum: Error KORVUSBDevEnum", 2},
+        ExternalFailure{"EsataFill", [](korvstandin::HostDescription &host) { host.esata.fillFails = true; },
+                        "KORVExternalDevEnum: Error KORVUSBDevEnum", 4},
+        ExternalFailure{"NegativeSize", [](korvstandin::HostDescription &host) { host.usb.neededClaim = -1; },
+                        "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE", 1},
+        ExternalFailure{"BlockNotAllocated", nullptr, "KORVExternalDevEnum error: Out of Memory", 1}),
+    [](const auto &info) { return std::string(info.param.name); });
 
 TEST_F(DiskIORecords, RecordsAndTotal)
 {

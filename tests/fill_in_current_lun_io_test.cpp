@@ -4,9 +4,10 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <json/reader.h>
 
+#include "json_text.h"
 #include "korv_standin.h"
+#include "platform_test.h"
 #include "korvsnmp/fill_in_current_lun_io.h"
 #include "syslog_capture.h"
 
@@ -21,33 +22,23 @@ using ::testing::IsEmpty;
 constexpr char kUnit[] = "fill_in_current_lun_io";
 constexpr char kLunListCall[] = "KORV::APIRunner::Exec(KORV.Core.ISCSI.LUN, 1, list, null, admin)";
 
-Json::Value Parse(const char *text)
-{
-    Json::Value value;
-    EXPECT_TRUE(Json::Reader().parse(text, value)) << text;
-    return value;
-}
+using korvtest::ParseJson;
 
-class LunIOTest : public ::testing::Test {
+class LunIOTest : public korvtest::PlatformTest {
 protected:
-    void SetUp() override
-    {
-        korvstandin::Reset();
-        korvtest::ClearLog();
-        korvstandin::SetJournal(true);
-    }
 
     // Runs the rewrite on `lunIO` and expects it to succeed with `expected`.
     static void ExpectRewritten(const char *lunIO, const char *expected)
     {
-        Json::Value records = Parse(lunIO);
+        Json::Value records = ParseJson(lunIO);
         EXPECT_TRUE(KORVSNMP::FillInCurrentLunIO(records));
-        EXPECT_EQ(records, Parse(expected)) << records.toStyledString();
+        EXPECT_EQ(records, ParseJson(expected)) << records.toStyledString();
     }
 };
 
 TEST_F(LunIOTest, RecordsAreNamedFromTheLunList)
 {
+    korvstandin::SetJournal(true);
     korvstandin::Host().luns = {{"u-1", "first"},   {"u-2", "old"}, {"u-2", "second"},
                                 {"u-3", 7},         {5, "five"},    {"u-4", Json::Value()},
                                 {Json::Value(), "orphan"}};
@@ -78,33 +69,39 @@ TEST_F(LunIOTest, RecordWithoutDeviceGetsTheEmptyText)
     ExpectRewritten(R"([{"read": 1}])", R"([{"uuid": "", "lun_name": "nameless", "read": 1}])");
 }
 
-TEST_F(LunIOTest, UnusableAnswerLeavesTheUuidAsName)
+struct UnusableAnswer {
+    const char *name;
+    LunAnswer answer;
+    bool execFails;
+    const char *message;
+};
+
+class LunIOUnusableAnswer : public korvtest::PlatformTestWithParam<UnusableAnswer> {};
+
+TEST_P(LunIOUnusableAnswer, LeavesTheUuidAsName)
 {
-    struct Case {
-        LunAnswer answer;
-        bool execFails;
-        const char *message;
-    } cases[] = {
-        {LunAnswer::Unsuccessful, false, "Failed to list LUNs"},
-        {LunAnswer::Normal, true, "Failed to list LUNs"},
-        {LunAnswer::WithoutData, false, "LUNs json data not found"},
-        {LunAnswer::WithoutLuns, false, "LUNs json data not found"},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.message);
-        korvstandin::Reset();
-        korvstandin::SetJournal(true);
-        korvtest::ClearLog();
-        korvstandin::Host().luns = {{"u-1", "first"}};
-        korvstandin::Host().lunAnswer = c.answer;
-        if (c.execFails)
-            korvstandin::SetFault(Op::APIRunnerExec);
-        ExpectRewritten(R"([{"device": "u-1", "read": 3}])",
-                        R"([{"uuid": "u-1", "lun_name": "u-1", "read": 3}])");
-        EXPECT_THAT(korvstandin::Journal(), ElementsAre(kLunListCall));
-        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
-    }
+    korvstandin::Host().luns = {{"u-1", "first"}};
+    korvstandin::Host().lunAnswer = GetParam().answer;
+    if (GetParam().execFails)
+        korvstandin::SetFault(Op::APIRunnerExec);
+    Json::Value records = ParseJson(R"([{"device": "u-1", "read": 3}])");
+    EXPECT_TRUE(KORVSNMP::FillInCurrentLunIO(records));
+    EXPECT_EQ(records, ParseJson(R"([{"uuid": "u-1", "lun_name": "u-1", "read": 3}])"));
+    EXPECT_EQ(korvstandin::CallCount(Op::APIRunnerExec), 1);
+    EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, GetParam().message)));
 }
+
+INSTANTIATE_TEST_SUITE_P(
+    Answers, LunIOUnusableAnswer,
+    ::testing::Values(UnusableAnswer{"Unsuccessful", LunAnswer::Unsuccessful, false, "Failed to list LUNs"},
+                      UnusableAnswer{"ExecFails", LunAnswer::Normal, true, "Failed to list LUNs"},
+                      UnusableAnswer{"SuccessNotBoolean", LunAnswer::SuccessNotBoolean, false,
+                                     "Failed to list LUNs"},
+                      UnusableAnswer{"WithoutData", LunAnswer::WithoutData, false, "LUNs json data not found"},
+                      UnusableAnswer{"WithoutLuns", LunAnswer::WithoutLuns, false, "LUNs json data not found"},
+                      UnusableAnswer{"LunsNotArray", LunAnswer::LunsNotArray, false,
+                                     "LUNs json data not found"}),
+    [](const auto &info) { return std::string(info.param.name); });
 
 TEST_F(LunIOTest, EmptyArrayAsksNothing)
 {
@@ -129,9 +126,9 @@ TEST_F(LunIOTest, UnreadableInputFailsAndStaysUntouched)
     for (const Case &c : cases) {
         SCOPED_TRACE(c.lunIO);
         korvtest::ClearLog();
-        Json::Value lunIO = Parse(c.lunIO);
+        Json::Value lunIO = ParseJson(c.lunIO);
         EXPECT_FALSE(KORVSNMP::FillInCurrentLunIO(lunIO));
-        EXPECT_EQ(lunIO, Parse(c.lunIO));
+        EXPECT_EQ(lunIO, ParseJson(c.lunIO));
         EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
     }
     EXPECT_EQ(korvstandin::CallCount(Op::APIRunnerExec), 0);

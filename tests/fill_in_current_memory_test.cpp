@@ -4,13 +4,16 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <json/reader.h>
 
 #include "korv_standin.h"
+#include "json_text.h"
+#include "platform_test.h"
 #include "korvsnmp/fill_in_current_memory.h"
 #include "syslog_capture.h"
 
 namespace {
+
+using korvtest::ParseJson;
 
 using korvtest::Logged;
 using ::testing::ElementsAre;
@@ -18,21 +21,7 @@ using ::testing::IsEmpty;
 
 constexpr char kUnit[] = "fill_in_current_memory";
 
-Json::Value Parse(const char *text)
-{
-    Json::Value value;
-    EXPECT_TRUE(Json::Reader().parse(text, value)) << text;
-    return value;
-}
-
-class MemoryTest : public ::testing::Test {
-protected:
-    void SetUp() override
-    {
-        korvstandin::Reset();
-        korvtest::ClearLog();
-    }
-};
+using MemoryTest = korvtest::PlatformTest;
 
 TEST_F(MemoryTest, MemorySizeComesFromThePlatformElseFromTotalReal)
 {
@@ -45,26 +34,23 @@ TEST_F(MemoryTest, MemorySizeComesFromThePlatformElseFromTotalReal)
         {8388608, R"({"total_real": 2048000, "memory_size": 7})", 8388608},
         {16, R"({"total_real": 1, "memory_size": "x", "unknown": {"a": [1, "b"]}, "s": "t"})", 16},
     };
-    korvstandin::SetJournal(true);
     for (const Case &c : cases) {
         SCOPED_TRACE(c.record);
         korvstandin::Host().physMemSize = c.platform;
-        Json::Value memory = Parse(R"({"stale": true})");
-        ASSERT_TRUE(KORVSNMP::FillInCurrentMemory(Parse(c.record), memory));
-        Json::Value expected = Parse(c.record);
+        Json::Value memory = ParseJson(R"({"stale": true})");
+        ASSERT_TRUE(KORVSNMP::FillInCurrentMemory(ParseJson(c.record), memory));
+        Json::Value expected = ParseJson(c.record);
         expected["memory_size"] = c.expected;
         EXPECT_EQ(memory, expected) << memory.toStyledString();
     }
-    EXPECT_THAT(korvstandin::Journal(), ElementsAre("KLIBSystemPhysMemSizeGet()",
-                                                    "KLIBSystemPhysMemSizeGet()",
-                                                    "KLIBSystemPhysMemSizeGet()"));
+    EXPECT_EQ(korvstandin::CallCount(korvstandin::Op::KLIBSystemPhysMemSizeGet), 3);
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
 }
 
 TEST_F(MemoryTest, RecordWithoutTotalRealIsCopiedAndFails)
 {
     korvstandin::Host().physMemSize = 16;
-    const Json::Value record = Parse(R"({"avail_real": 2, "memory_size": 3})");
+    const Json::Value record = ParseJson(R"({"avail_real": 2, "memory_size": 3})");
     Json::Value memory;
     EXPECT_FALSE(KORVSNMP::FillInCurrentMemory(record, memory));
     EXPECT_EQ(memory, record);
@@ -87,9 +73,9 @@ TEST_F(MemoryTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
     for (const Case &c : cases) {
         SCOPED_TRACE(c.record);
         korvtest::ClearLog();
-        Json::Value memory = Parse(R"({"earlier": 1})");
-        EXPECT_FALSE(KORVSNMP::FillInCurrentMemory(Parse(c.record), memory));
-        EXPECT_EQ(memory, Parse(R"({"earlier": 1})"));
+        Json::Value memory = ParseJson(R"({"earlier": 1})");
+        EXPECT_FALSE(KORVSNMP::FillInCurrentMemory(ParseJson(c.record), memory));
+        EXPECT_EQ(memory, ParseJson(R"({"earlier": 1})"));
         EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
     }
 }

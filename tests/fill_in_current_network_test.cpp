@@ -7,8 +7,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-
 #include "korv_standin.h"
+#include "platform_test.h"
 #include "json_text.h"
 #include "korvsnmp/fill_in_current_network.h"
 #include "syslog_capture.h"
@@ -44,13 +44,8 @@ NetInterface OvsMaster(const std::string &name)
     return {name, NetRole::OvsMaster};
 }
 
-class NetworkTest : public ::testing::Test {
+class NetworkTest : public korvtest::PlatformTest {
 protected:
-    void SetUp() override
-    {
-        korvstandin::Reset();
-        korvtest::ClearLog();
-    }
 
     // Runs the fill-in on `network` over an output holding "earlier"; the
     // output as compact text.
@@ -177,8 +172,7 @@ TEST_F(NetworkTest, NoInterfaceLeavesTheBareTotalAndThePlatformsError)
     EXPECT_THAT(LoggedMessages(),
                 ElementsAre(Logged(LOG_ERR, kUnit, "Failed to get net interface, errno=0x1D2")));
 
-    korvstandin::Reset();  // a platform that lists nothing fails alike
-    korvtest::ClearLog();
+    korvtest::FreshPlatform();  // a platform that lists nothing fails alike
     EXPECT_EQ(Fill("[]", false), Canonical(R"([{"device": "total"}])"));
     EXPECT_THAT(LoggedMessages(),
                 ElementsAre(Logged(LOG_ERR, kUnit, "Failed to get net interface, errno=0x0")));

@@ -11,6 +11,7 @@
 
 #include "korv_standin.h"
 #include "live_host.h"
+#include "platform_test.h"
 
 namespace {
 
@@ -19,10 +20,11 @@ using korvstandin::HostDescription;
 using korvstandin::NetRole;
 using ::testing::ElementsAre;
 
-class LiveHostTest : public ::testing::Test {
+class LiveHostTest : public korvtest::PlatformTest {
 protected:
     void SetUp() override
     {
+        PlatformTest::SetUp();
         char pattern[] = "/tmp/korvsnmp-live-XXXXXX";
         ASSERT_NE(mkdtemp(pattern), nullptr);
         root_ = pattern;
@@ -31,6 +33,7 @@ protected:
     {
         fs::remove_all(root_);
         korvstandin::Reset();
+        PlatformTest::TearDown();
     }
 
     void Write(const std::string &path, const std::string &text)
@@ -83,21 +86,20 @@ TEST_F(LiveHostTest, InterfacesWithVlansBondsAndPpp)
     Write("proc/net/vlan/config",
           "VLAN Dev name    | VLAN ID\nName-Type: VLAN_NAME_TYPE_RAW_PLUS_VID_NO_PAD\n"
           "eth0.5         | 5  | eth0\n");
+    const std::string root = root_.string();
+    using korvstandin::live::ProbeInterface;
 
-    HostDescription host;
-    korvstandin::live::ProbeNetwork(root_.string(), host);
-
-    std::vector<std::string> names;
-    for (const auto &entry : host.interfaces)
-        names.push_back(entry.name);
-    EXPECT_THAT(names, ElementsAre("bond0", "eth0", "eth0.5", "eth1", "ppp0"));
-    EXPECT_EQ(host.interfaces[0].role, NetRole::Aggregation);
-    EXPECT_THAT(host.interfaces[0].members, ElementsAre("eth0", "eth1"));
-    EXPECT_EQ(host.interfaces[2].role, NetRole::Vlan);
-    EXPECT_EQ(host.interfaces[2].vlanParent, "eth0");
-    EXPECT_EQ(host.interfaces[2].vlanName, "eth0.5");
-    EXPECT_EQ(host.interfaces[1].role, NetRole::Plain);
-    EXPECT_EQ(host.pppoeInterface, "ppp0");
+    EXPECT_THAT(korvstandin::live::ProbeInterfaceNames(root),
+                ElementsAre("bond0", "eth0", "eth0.5", "eth1", "ppp0"));
+    EXPECT_EQ(ProbeInterface(root, "bond0")->role, NetRole::Aggregation);
+    EXPECT_THAT(ProbeInterface(root, "bond0")->members, ElementsAre("eth0", "eth1"));
+    EXPECT_EQ(ProbeInterface(root, "eth0.5")->role, NetRole::Vlan);
+    EXPECT_EQ(ProbeInterface(root, "eth0.5")->vlanParent, "eth0");
+    EXPECT_EQ(ProbeInterface(root, "eth0.5")->vlanName, "eth0.5");
+    EXPECT_EQ(ProbeInterface(root, "eth0")->role, NetRole::Plain);
+    for (const char *absent : {"eth9", "", "..", "../net/eth0"})
+        EXPECT_FALSE(ProbeInterface(root, absent)) << absent;
+    EXPECT_EQ(korvstandin::live::ProbePppLink(root), "ppp0");
 }
 
 TEST_F(LiveHostTest, MountedBlockDevicesBecomeSpacesNamedByMountPoint)
@@ -153,7 +155,8 @@ TEST_F(LiveHostTest, StringsFileWhenPresentElseShippedTexts)
 
 TEST_F(LiveHostTest, StandinAnswersFromThisMachineUntilDescribed)
 {
-    korvstandin::UseLiveHost();
+    unsetenv("KORVPLATFORM_HOST");
+    korvstandin::UseProcessHost();
 
     EXPECT_EQ(KLIBSystemPhysMemSizeGet(), korvstandin::live::ProbeMemory());
     EXPECT_GT(KLIBSystemPhysMemSizeGet(), 0u);

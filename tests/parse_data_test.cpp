@@ -8,10 +8,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <json/reader.h>
-
 #include "json_text.h"
 #include "korv_standin.h"
+#include "platform_test.h"
 #include "korvsnmp/parse_data.h"
 #include "syslog_capture.h"
 
@@ -24,8 +23,7 @@ using ::testing::IsEmpty;
 
 const char kUnit[] = "parse_data";
 
-using korvtest::ParseJson;
-Json::Value Parse(const std::string &text) { return ParseJson(text); }
+const auto Parse = korvtest::ParseJson;
 
 // A reply with every section, small enough that each fill-in succeeds.
 Json::Value FullReply()
@@ -52,13 +50,12 @@ std::set<std::string> Members(const Json::Value &result)
 const std::set<std::string> kEverySection = {"cpu", "disk", "lun", "memory", "network",
                                              "nfs", "space", "time"};
 
-class ParseDataTest : public ::testing::Test {
+class ParseDataTest : public korvtest::PlatformTest {
 protected:
     void SetUp() override
     {
-        korvstandin::Reset();
+        PlatformTest::SetUp();
         korvstandin::Host().interfaces = {{"eth0"}};
-        korvtest::ClearLog();
     }
 };
 

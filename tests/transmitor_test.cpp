@@ -17,7 +17,7 @@
 #include "select_hook.h"
 #include "syslog_capture.h"
 #include "test_collector.h"
-#include "throwing_allocation.h"
+#include "allocation_failure.h"
 
 namespace {
 

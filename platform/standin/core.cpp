@@ -3,13 +3,14 @@
 #include <map>
 #include <new>
 
-#include "standin_internal.h"
+#include "standin_state.h"
 
 using korvstandin::Fault;
 using korvstandin::detail::Current;
 using korvstandin::detail::Domain;
 using korvstandin::Op;
 using korvstandin::detail::Enter;
+using korvstandin::detail::Guarded;
 using korvstandin::detail::Text;
 
 struct KLIBCSzList {
@@ -59,8 +60,11 @@ KLIBCSzHash *KLIBCSzHashAlloc(int size)
     if (Enter(Op::KLIBCSzHashAlloc, size) != Fault::None || size <= 0)
         return nullptr;
     auto *hash = new (std::nothrow) KLIBCSzHash;
-    if (hash != nullptr)
-        korvstandin::detail::Allocated();
+    if (hash == nullptr) {
+        korvstandin::detail::OutOfMemory(Op::KLIBCSzHashAlloc);
+        return nullptr;
+    }
+    korvstandin::detail::Allocated();
     return hash;
 }
 
@@ -72,8 +76,10 @@ int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value)
         korvstandin::detail::SetLastError(0x0D02, "core", __LINE__);
         return -1;
     }
-    (*hash)->values[key] = value;
-    return 0;
+    return Guarded(Op::KLIBCSzHashSetValue, -1, [&] {
+        (*hash)->values[key] = value;
+        return 0;
+    });
 }
 
 const char *KLIBCSzHashGetValue(const KLIBCSzHash *hash, const char *key)
@@ -81,8 +87,10 @@ const char *KLIBCSzHashGetValue(const KLIBCSzHash *hash, const char *key)
     if (Enter(Op::KLIBCSzHashGetValue, Text(key)) != Fault::None || hash == nullptr ||
         key == nullptr)
         return nullptr;
-    auto found = hash->values.find(key);
-    return found == hash->values.end() ? nullptr : found->second.c_str();
+    return Guarded(Op::KLIBCSzHashGetValue, static_cast<const char *>(nullptr), [&] {
+        auto found = hash->values.find(key);
+        return found == hash->values.end() ? nullptr : found->second.c_str();
+    });
 }
 
 void KLIBCSzHashFree(KLIBCSzHash *hash)
@@ -103,18 +111,20 @@ int KLIBCFileGetSectionValue(const char *path, const char *section, const char *
     if (path == nullptr || section == nullptr || key == nullptr || buffer == nullptr ||
         size <= 0)
         return -1;
-    const auto &files = Current(Domain::Files).files;
-    auto file = files.find(path);
-    if (file == files.end())
-        return -1;
-    auto sectionEntry = file->second.find(section);
-    if (sectionEntry == file->second.end())
-        return -1;
-    auto value = sectionEntry->second.find(key);
-    if (value == sectionEntry->second.end())
-        return -1;
-    korvstandin::detail::CopyText(buffer, static_cast<size_t>(size), value->second);
-    return 0;
+    return Guarded(Op::KLIBCFileGetSectionValue, -1, [&] {
+        const auto &files = Current(Domain::Files).files;
+        auto file = files.find(path);
+        if (file == files.end())
+            return -1;
+        auto sectionEntry = file->second.find(section);
+        if (sectionEntry == file->second.end())
+            return -1;
+        auto value = sectionEntry->second.find(key);
+        if (value == sectionEntry->second.end())
+            return -1;
+        korvstandin::detail::CopyText(buffer, static_cast<size_t>(size), value->second);
+        return 0;
+    });
 }
 
 }  // extern "C"

@@ -1,10 +1,11 @@
-// The stand-in for the host platform (libkorvplatform.so.1).
+// Test control of the stand-in for the host platform (libkorvplatform.so.1).
 //
-// It implements every operation of korv_platform.h by its contract (record
-// layouts, list allocation and release, failure results) and answers from
-// one in-memory description of a host. Tests fill that description and switch
-// operations to fail; nothing here is read by libkorvsnmp, which sees only the
-// platform operations.
+// The stand-in implements every operation of korv_platform.h by its contract
+// (record layouts, list allocation and release, failure results) and answers
+// from one description of a host: the live machine, the file named by
+// KORVPLATFORM_HOST (host_file.h), or one that a test fills in here. Tests
+// also switch operations to fail and watch the calls; libkorvsnmp sees only
+// the platform operations. This header is not installed.
 //
 // The description and the switches are process-wide and unsynchronised:
 // change them only while no platform operation runs.
@@ -49,6 +50,8 @@ struct ExternalDeviceSet {
     std::vector<ExternalDevice> devices{};
     bool sizeQueryFails = false;  // KORVUSBDevEnum's size query fails for this kind
     bool fillFails = false;       // its filling call fails for this kind
+    std::optional<int> neededClaim{};  // size stored by the size query instead of the true one
+    std::optional<int> countClaim{};   // filling call's answer instead of the number of devices
 };
 
 enum class NetRole { Plain, Vlan, Aggregation, OvsMaster };
@@ -72,8 +75,8 @@ struct Space {
 };
 
 struct FlashCache {
-    std::string spacePath{};
-    std::string volumePath{};
+    std::optional<std::string> spacePath{};   // none: the record carries a null pointer
+    std::optional<std::string> volumePath{};  // none: the record carries a null pointer
     std::string layerPath{};     // what KORVVSpaceLayerPathGet answers for this cache
     bool layerFails = false;   // KORVVSpaceLayerPathGet fails for it
 };
@@ -84,7 +87,14 @@ struct Lun {
 };
 
 // How the web API answers "list" of "KORV.Core.ISCSI.LUN".
-enum class LunAnswer { Normal, Unsuccessful, WithoutData, WithoutLuns };
+enum class LunAnswer {
+    Normal,
+    Unsuccessful,
+    WithoutData,
+    WithoutLuns,
+    SuccessNotBoolean,  // "success" is the string "true"
+    LunsNotArray,       // "luns" is an object holding the LUNs by UUID
+};
 
 // A sectioned text file: section -> key -> value.
 using SectionedFile = std::map<std::string, std::map<std::string, std::string>>;
@@ -100,6 +110,7 @@ struct HostDescription {
     ExternalDeviceSet esata{};
 
     std::vector<NetInterface> interfaces{};
+    std::optional<int> interfaceCountClaim{};  // KLIBNetGetInterfaceInfo's answer instead of the count filled
     std::string pppoeInterface{};  // empty: no PPPoE link
 
     std::vector<Space> spaces{};
@@ -109,6 +120,11 @@ struct HostDescription {
     LunAnswer lunAnswer = LunAnswer::Normal;
 
     std::map<std::string, SectionedFile> files{};  // by path; a missing path is an absent file
+
+    // Malformed answers: texts as long as their fixed field or longer fill it
+    // without a terminating NUL; the last error names no source file (null).
+    bool unterminatedFields = false;
+    bool nullErrorFile = false;
 };
 
 // ---- Operations, fault switches and observation -----------------------------
@@ -157,22 +173,53 @@ enum class Fault {
     FailLeavingList,   // list operations: fail, yet hand out the list as well
 };
 
+// Which calls of an operation a fault hits, counted from 1 since Reset.
+struct Calls {
+    int first = 1;
+    bool later = true;  // also every call after `first`
+
+    static Calls Every() { return {1, true}; }
+    static Calls Only(int call) { return {call, false}; }
+    static Calls From(int call) { return {call, true}; }
+};
+
+// The last error of a call that ran out of memory, and the default of faults.
+inline constexpr unsigned int kOutOfMemoryError = 0x0D01;
+
 // A failing operation gives its contract's failure result (negative, 0 or
 // null, as the operation's declaration says) and sets the platform's last
-// error to `errorCode`. Operations without a failure result (the releases,
-// the last-error queries) ignore the switch.
-void SetFault(Op op, Fault fault = Fault::Fail, unsigned int errorCode = 0x0D01);
+// error to `errorCode` ("standin" and the operation's index as its file and
+// line). Operations without a failure result (the releases, the last-error
+// queries, KLIBCIsQuillbox) ignore the switch. One switch per operation: a
+// new call replaces the old one.
+void SetFault(Op op, Fault fault = Fault::Fail, unsigned int errorCode = kOutOfMemoryError,
+              Calls calls = Calls::Every());
+
+// A call of one operation: the `call`-th since Reset.
+struct CallRef {
+    Op op;
+    int call;
+};
+
+// Calls that ran out of memory (std::bad_alloc, or a null from a
+// non-throwing allocation) since Reset, in order. Such a call releases what
+// it had built, sets the last error as a fault with kOutOfMemoryError does,
+// and gives its failure result: no exception leaves an operation.
+const std::vector<CallRef> &OutOfMemoryCalls();
 
 // The description that the operations answer from.
 HostDescription &Host();
 
-// Empties the description, clears every fault, the counters, the journal and
-// the last error. Outstanding allocations are real and stay counted.
+// Empties the description, clears every fault, the counters, the journal,
+// the out-of-memory calls and the last error. Outstanding allocations are
+// real and stay counted.
 void Reset();
 
-// Answers from the live host again, as before any test described one: every
-// enumeration probes this machine afresh. Faults and counters stay.
-void UseLiveHost();
+// Answers as in a process that no test controls, as before any test
+// described a host: the next call reads KORVPLATFORM_HOST afresh and answers
+// from that file, or from the live host (probed afresh by every query) when
+// the variable is unset. Faults and counters stay.
+void UseProcessHost();
 
 // Number of calls of `op` since the last Reset.
 int CallCount(Op op);

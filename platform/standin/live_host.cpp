@@ -133,42 +133,67 @@ void ProbeDisks(const std::string &root, HostDescription &host)
     }
 }
 
-void ProbeNetwork(const std::string &root, HostDescription &host)
+std::optional<ExternalDevice> ProbeExternalDevice(const std::string &root, const std::string &name,
+                                                  bool usb)
 {
-    std::map<std::string, std::string> vlanParents;
+    const fs::path entry = fs::path(root + "/sys/block") / name;
+    std::error_code error;
+    if (name.empty() || name.find('/') != std::string::npos || !fs::exists(entry / "device", error) ||
+        OnUsbBus(entry) != usb)
+        return std::nullopt;
+    std::string text =
+        Trim(ReadTrimmed(entry / "device/vendor") + " " + ReadTrimmed(entry / "device/model"));
+    return ExternalDevice{name, text.empty() ? name : text};
+}
+
+std::vector<std::string> ProbeInterfaceNames(const std::string &root)
+{
+    std::vector<std::string> names = ListDirectory(root + "/sys/class/net");
+    names.erase(std::remove(names.begin(), names.end(), kLoopback), names.end());
+    return names;
+}
+
+std::optional<NetInterface> ProbeInterface(const std::string &root, const std::string &name)
+{
+    const fs::path directory = fs::path(root + "/sys/class/net") / name;
+    std::error_code error;
+    if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos ||
+        !fs::exists(directory, error))
+        return std::nullopt;
+    NetInterface entry;
+    entry.name = name;
+
     std::string config;
     if (ReadFile(root + "/proc/net/vlan/config", config)) {
         std::istringstream lines(config);
         std::string line;
         for (size_t n = 0; std::getline(lines, line); ++n) {
             size_t first = line.find('|'), last = line.rfind('|');
-            if (n < kVlanConfigHeaderLines || first == std::string::npos || first == last)
+            if (n < kVlanConfigHeaderLines || first == std::string::npos || first == last ||
+                Trim(line.substr(0, first)) != name)
                 continue;
-            vlanParents[Trim(line.substr(0, first))] = Trim(line.substr(last + 1));
-        }
-    }
-
-    const fs::path interfaces = fs::path(root + "/sys/class/net");
-    for (const std::string &name : ListDirectory(interfaces)) {
-        if (name == kLoopback)
-            continue;
-        NetInterface entry;
-        entry.name = name;
-        std::string slaves;
-        if (auto vlan = vlanParents.find(name); vlan != vlanParents.end()) {
             entry.role = NetRole::Vlan;
-            entry.vlanParent = vlan->second;
+            entry.vlanParent = Trim(line.substr(last + 1));
             entry.vlanName = name;
-        } else if (ReadFile(interfaces / name / "bonding/slaves", slaves)) {
-            entry.role = NetRole::Aggregation;
-            std::istringstream members(slaves);
-            for (std::string member; members >> member;)
-                entry.members.push_back(member);
+            return entry;
         }
-        if (host.pppoeInterface.empty() && name.rfind(kPppPrefix, 0) == 0)
-            host.pppoeInterface = name;
-        host.interfaces.push_back(entry);
     }
+    std::string slaves;
+    if (ReadFile(directory / "bonding/slaves", slaves)) {
+        entry.role = NetRole::Aggregation;
+        std::istringstream members(slaves);
+        for (std::string member; members >> member;)
+            entry.members.push_back(member);
+    }
+    return entry;
+}
+
+std::string ProbePppLink(const std::string &root)
+{
+    for (const std::string &name : ListDirectory(root + "/sys/class/net"))
+        if (name.rfind(kPppPrefix, 0) == 0)
+            return name;
+    return "";
 }
 
 void ProbeSpaces(const std::string &root, HostDescription &host)

@@ -5,7 +5,9 @@
 #ifndef KORV_STANDIN_LIVE_HOST_H
 #define KORV_STANDIN_LIVE_HOST_H
 
+#include <optional>
 #include <string>
+#include <vector>
 
 #include "korv_standin.h"
 
@@ -18,9 +20,21 @@ unsigned int ProbeMemory();
 // order, and devices on a USB bus as USB devices with their model as text.
 void ProbeDisks(const std::string &root, HostDescription &host);
 
-// Interfaces from sys/class/net (the loopback left out), VLANs from
-// proc/net/vlan/config, bonding masters and their slaves, a ppp link.
-void ProbeNetwork(const std::string &root, HostDescription &host);
+// The external device `name` (sys/block/<name>) when it is one of the kind
+// asked for (on a USB bus or not), with its vendor and model as text.
+std::optional<ExternalDevice> ProbeExternalDevice(const std::string &root, const std::string &name,
+                                                  bool usb);
+
+// Interface names from sys/class/net, sorted, the loopback left out.
+std::vector<std::string> ProbeInterfaceNames(const std::string &root);
+
+// One interface of sys/class/net: a VLAN when proc/net/vlan/config lists it,
+// a link aggregation with its members when it is a bonding master, else
+// plain. None when sys/class/net has no such interface.
+std::optional<NetInterface> ProbeInterface(const std::string &root, const std::string &name);
+
+// The first interface whose name starts with "ppp"; empty when none.
+std::string ProbePppLink(const std::string &root);
 
 // Block-device filesystems mounted (proc/self/mounts), named after their
 // mount point.

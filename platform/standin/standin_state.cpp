@@ -1,9 +1,14 @@
-// The stand-in's host description, fault switches and observation.
+// The stand-in's state: the description, fault switches and observation.
+#include "standin_state.h"
+
+#include <syslog.h>
+
 #include <array>
+#include <cstdlib>
 #include <cstring>
 
+#include "host_file.h"
 #include "live_host.h"
-#include "standin_internal.h"
 
 namespace korvstandin {
 namespace {
@@ -11,6 +16,7 @@ namespace {
 struct FaultSwitch {
     Fault fault = Fault::None;
     unsigned int errorCode = 0;
+    Calls calls{};
 };
 
 struct LastError {
@@ -19,13 +25,23 @@ struct LastError {
     int line = 0;
 };
 
+// Where the description comes from.
+enum class Source {
+    Test,         // a test fills it in
+    Undecided,    // a process host: KORVPLATFORM_HOST not yet looked at
+    LiveHost,     // probed from this machine
+    HostFile,     // read from the host file
+    BadHostFile,  // the host file is unusable: every operation fails
+};
+
 struct State {
     HostDescription host;
-    bool described = false;  // a test describes the host; else it is probed live
+    Source source = Source::Undecided;
     std::array<FaultSwitch, static_cast<size_t>(Op::Count_)> faults{};
     std::array<int, static_cast<size_t>(Op::Count_)> calls{};
     bool journalOn = false;
     std::vector<std::string> journal;
+    std::vector<CallRef> outOfMemory;
     LastError lastError;
     int outstanding = 0;
 };
@@ -51,43 +67,82 @@ constexpr const char *kOpNames[] = {
 };
 static_assert(std::size(kOpNames) == static_cast<size_t>(Op::Count_), "one name per operation");
 
+constexpr char kFaultFile[] = "standin";
+// The last error of every call while the host file is unusable.
+constexpr unsigned int kBadHostFileError = 0x0D03;
+
 size_t Index(Op op) { return static_cast<size_t>(op); }
+
+// A process host: the file that KORVPLATFORM_HOST names, else the live host.
+void ChooseProcessHost(State &state)
+{
+    const char *path = std::getenv(kHostFileVariable);
+    if (path == nullptr) {
+        state.source = Source::LiveHost;
+        return;
+    }
+    std::string error;
+    HostDescription host;
+    bool read = false;
+    try {
+        read = ReadHostFile(path, host, error);
+    } catch (const std::bad_alloc &) {
+        error = "out of memory";
+    }
+    if (read) {
+        state.host = std::move(host);
+        state.source = Source::HostFile;
+        return;
+    }
+    state.source = Source::BadHostFile;
+    syslog(LOG_ERR, "%s:%d Host description %s: %s; every platform operation fails", "korvplatform",
+           __LINE__, path, error.c_str());
+}
+
+bool HitsCall(const FaultSwitch &fault, int call)
+{
+    return fault.fault != Fault::None &&
+           (call == fault.calls.first || (fault.calls.later && call > fault.calls.first));
+}
 
 }  // namespace
 
 const char *OpName(Op op) { return op < Op::Count_ ? kOpNames[Index(op)] : "?"; }
 
-void SetFault(Op op, Fault fault, unsigned int errorCode)
+void SetFault(Op op, Fault fault, unsigned int errorCode, Calls calls)
 {
     if (op < Op::Count_)
-        TheState().faults[Index(op)] = {fault, errorCode};
+        TheState().faults[Index(op)] = {fault, errorCode, calls};
 }
 
 HostDescription &Host()
 {
-    TheState().described = true;
+    TheState().source = Source::Test;
     return TheState().host;
 }
 
 void Reset()
 {
     State &state = TheState();
-    state.described = true;
+    state.source = Source::Test;
     state.host = HostDescription{};
     state.faults.fill({});
     state.calls.fill(0);
     state.journalOn = false;
     state.journal.clear();
+    state.outOfMemory.clear();
     state.lastError = {};
 }
 
-void UseLiveHost()
+void UseProcessHost()
 {
-    TheState().described = false;
+    TheState().source = Source::Undecided;
     TheState().host = HostDescription{};
 }
 
 int CallCount(Op op) { return op < Op::Count_ ? TheState().calls[Index(op)] : 0; }
+
+const std::vector<CallRef> &OutOfMemoryCalls() { return TheState().outOfMemory; }
 
 int OutstandingAllocations() { return TheState().outstanding; }
 
@@ -97,10 +152,12 @@ const std::vector<std::string> &Journal() { return TheState().journal; }
 
 namespace detail {
 
+bool Described() { return TheState().source != Source::LiveHost; }
+
 const HostDescription &Current(Domain domain)
 {
     State &state = TheState();
-    if (state.described)
+    if (state.source != Source::LiveHost)
         return state.host;
     HostDescription &host = state.host;
     const std::string liveRoot;  // the real /
@@ -116,11 +173,6 @@ const HostDescription &Current(Domain domain)
         host.esata = {};
         host.expansionUnits.clear();
         live::ProbeDisks(liveRoot, host);
-        break;
-    case Domain::Network:
-        host.interfaces.clear();
-        host.pppoeInterface.clear();
-        live::ProbeNetwork(liveRoot, host);
         break;
     case Domain::Storage:
         host.spaces.clear();
@@ -146,16 +198,32 @@ void Record(std::string entry) { TheState().journal.push_back(std::move(entry));
 Fault EnterFault(Op op)
 {
     State &state = TheState();
-    ++state.calls[Index(op)];
+    if (state.source == Source::Undecided)
+        ChooseProcessHost(state);
+    const int call = ++state.calls[Index(op)];
+    if (state.source == Source::BadHostFile) {
+        SetLastError(kBadHostFileError, kFaultFile, static_cast<int>(Index(op)));
+        return Fault::Fail;
+    }
     const FaultSwitch &fault = state.faults[Index(op)];
-    if (fault.fault != Fault::None)
-        SetLastError(fault.errorCode, "standin", static_cast<int>(Index(op)));
+    if (!HitsCall(fault, call))
+        return Fault::None;
+    SetLastError(fault.errorCode, kFaultFile, static_cast<int>(Index(op)));
     return fault.fault;
 }
 
 void SetLastError(unsigned int code, const char *file, int line)
 {
     TheState().lastError = {code, file, line};
+}
+
+bool NullErrorFile() { return TheState().source != Source::LiveHost && TheState().host.nullErrorFile; }
+
+void OutOfMemory(Op op)
+{
+    State &state = TheState();
+    SetLastError(kOutOfMemoryError, kFaultFile, static_cast<int>(Index(op)));
+    state.outOfMemory.push_back({op, state.calls[Index(op)]});
 }
 
 void Allocated() { ++TheState().outstanding; }
@@ -165,6 +233,11 @@ void CopyText(char *buffer, size_t size, const std::string &text)
 {
     if (buffer == nullptr || size == 0)
         return;
+    const State &state = TheState();
+    if (state.source != Source::LiveHost && state.host.unterminatedFields && text.size() >= size) {
+        std::memcpy(buffer, text.data(), size);
+        return;
+    }
     size_t length = std::min(text.size(), size - 1);
     std::memcpy(buffer, text.data(), length);
     buffer[length] = '\0';
@@ -186,6 +259,8 @@ extern "C" unsigned int KLIBCErrGet(void)
 extern "C" const char *KLIBCErrorGetFile(void)
 {
     korvstandin::detail::Enter(Op::KLIBCErrorGetFile);
+    if (korvstandin::detail::NullErrorFile())
+        return nullptr;
     return korvstandin::TheState().lastError.file.c_str();
 }
 

@@ -3,6 +3,8 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <pthread.h>
+#include <signal.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -22,10 +24,25 @@ constexpr char kUnit[] = "sampler";
 constexpr char kWakeSample = 's';
 constexpr char kWakeStop = 'q';
 constexpr size_t kPppoeNameSize = 16;
+// Sent to the sampling thread on stop: it breaks a wait on the collector
+// (the library's select() fails with EINTR), so a stop never waits 90 s.
+constexpr int kInterruptSignal = SIGUSR2;
+constexpr auto kInterruptRepeat = std::chrono::milliseconds(50);
 
-const char *const kResources[] = {"cpu", "memory", "network", "disk", "space", "lun", "nfs"};
-// The result member that each resource fills, in kResources' order.
-const char *const kMembers[] = {"cpu", "memory", "network", "disk", "space", "lun", "nfs"};
+void IgnoreInterrupt(int) {}
+
+// Each resource, the reply section that it needs and the result member
+// that it fills.
+struct Section {
+    const char *resource;
+    const char *replySection;
+    const char *member;
+};
+const Section kSections[] = {
+    {"cpu", "System", "cpu"},      {"memory", "Memory", "memory"}, {"network", "Network", "network"},
+    {"disk", "DiskIO", "disk"},    {"space", "SpaceIO", "space"},  {"lun", "iSCSI", "lun"},
+    {"nfs", "NFS", "nfs"},
+};
 
 Json::Value RequestFor(const char *resource)
 {
@@ -36,7 +53,7 @@ Json::Value RequestFor(const char *resource)
 
 // SNMPParseReplyData, with the JSON library's errors on values of unexpected
 // types kept in here.
-bool Assemble(const Json::Value &request, const Json::Value &reply, Json::Value &result)
+bool Assemble(const Json::Value &request, Json::Value &reply, Json::Value &result)
 {
     try {
         return SNMPParseReplyData(request, reply, result);
@@ -55,26 +72,28 @@ SampleOutcome TakeSample()
 {
     SampleOutcome outcome;
     Transmitor transmitor("localhost");
-    Json::Value request = RequestFor("all");
     Json::Value reply;
-    if (transmitor.Transmit(request) != 0 || transmitor.GetDataJson(reply) != 0)
+    if (transmitor.Transmit(RequestFor("all")) != 0 || transmitor.GetDataJson(reply) != 0)
         return outcome;
     outcome.replied = true;
-    Json::Value whole(Json::objectValue);
-    if (Assemble(request, reply, whole) && whole.isObject()) {
-        outcome.result = std::move(whole);
-        return outcome;
-    }
-    // Something is missing or malformed: take each section on its own, so that
-    // one bad section leaves the others in place and its own table empty.
     outcome.result = Json::Value(Json::objectValue);
-    for (size_t i = 0; i < std::size(kResources); ++i) {
+    Json::Value none;
+    Json::Value &data = reply.isObject() && reply["data"].isObject() ? reply["data"] : none;
+    const Json::Value *time = data.isObject() ? data.find("time", "time" + 4) : nullptr;
+    if (time != nullptr)
+        outcome.result["time"] = *time;
+    // Each section on its own, moved out of the reply: a section that is
+    // missing or that the library refuses leaves only its own table empty.
+    for (const Section &section : kSections) {
         Json::Value part(Json::objectValue);
-        Assemble(RequestFor(kResources[i]), reply, part);
-        if (part.isObject() && part.isMember(kMembers[i]))
-            outcome.result[kMembers[i]] = part[kMembers[i]];
-        if (part.isObject() && part.isMember("time"))
-            outcome.result["time"] = part["time"];
+        if (data.isObject() && data.isMember(section.replySection))
+            part["data"][section.replySection].swapPayload(data[section.replySection]);
+        if (time != nullptr)
+            part["data"]["time"] = *time;
+        Json::Value filled(Json::objectValue);
+        Assemble(RequestFor(section.resource), part, filled);
+        if (filled.isObject() && filled.isMember(section.member))
+            outcome.result[section.member].swapPayload(filled[section.member]);
     }
     return outcome;
 }
@@ -120,8 +139,15 @@ void Sampler::Start()
         syslog(LOG_ERR, "%s:%d Cannot create the wake-up pipe, errno=%d", kUnit, __LINE__, errno);
         wakeFds_[0] = wakeFds_[1] = -1;
     }
+    struct sigaction interrupt {};
+    interrupt.sa_handler = IgnoreInterrupt;  // no SA_RESTART: waits end with EINTR
+    sigaction(kInterruptSignal, &interrupt, nullptr);
     stopping_ = false;
-    thread_ = std::thread(&Sampler::Run, this);
+    running_ = true;
+    thread_ = std::thread([this] {
+        Run();
+        running_ = false;
+    });
 }
 
 void Sampler::Stop()
@@ -131,8 +157,14 @@ void Sampler::Stop()
         ssize_t ignored = write(wakeFds_[1], &kWakeStop, 1);
         (void)ignored;
     }
-    if (thread_.joinable())
+    if (thread_.joinable()) {
+        // The thread may be about to wait on the collector: repeat until it ends.
+        while (running_) {
+            pthread_kill(thread_.native_handle(), kInterruptSignal);
+            std::this_thread::sleep_for(kInterruptRepeat);
+        }
         thread_.join();
+    }
     for (int &fd : wakeFds_) {
         if (fd >= 0)
             close(fd);

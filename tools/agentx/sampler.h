@@ -42,6 +42,8 @@ public:
     Sampler &operator=(const Sampler &) = delete;
 
     void Start();
+    // Ends the thread, breaking off an exchange with the collector under way
+    // (SIGUSR2 to the thread). Call it from one thread only.
     void Stop();
     // Takes a sample now. Async-signal-safe.
     void SampleNow();
@@ -56,6 +58,7 @@ private:
     const uint32_t intervalSeconds_;
     int wakeFds_[2] = {-1, -1};
     std::atomic<bool> stopping_{false};
+    std::atomic<bool> running_{false};
     std::atomic<uint32_t> failed_{0};
     bool collectorAway_ = false;
     TableIndexes indexes_;

@@ -12,6 +12,7 @@ namespace korvagentx {
 namespace {
 
 constexpr uint64_t kMax32 = 0xFFFFFFFFull;
+constexpr size_t kDisplayStringSize = 255;  // DisplayString's SIZE (0..255)
 
 // A member of an object, or nullptr (for a missing member or a non-object:
 // jsoncpp's lookups throw on arrays and scalars).
@@ -69,7 +70,7 @@ public:
     void AddText(Oid oid, const Json::Value *member)
     {
         if (std::optional<std::string> text = Text(member))
-            Add(std::move(oid), {ValueType::Text, 0, std::move(*text)});
+            Add(std::move(oid), {ValueType::Text, 0, text->substr(0, kDisplayStringSize)});
     }
 
     void AddColumns(uint32_t group, const Json::Value *record, std::initializer_list<Column> columns)

@@ -5,7 +5,8 @@
 // objects of KORVSNMP-MIB, sorted by OID. A section that is missing or of the
 // wrong shape gives no objects (an empty table); a member that is missing or
 // not a non-negative number (counters) or not a string (names) gives no
-// object for that cell. Rates wider than 32 bits are clamped to 4294967295.
+// object for that cell. Rates wider than 32 bits are clamped to 4294967295;
+// texts are cut to a DisplayString's 255 bytes.
 #ifndef KORVAGENTX_SNAPSHOT_H
 #define KORVAGENTX_SNAPSHOT_H
 

@@ -1,0 +1,363 @@
+// The whole road (SNMPParseReplyData over a described appliance and its
+// reply) with one failure at a time: every call of every platform operation
+// in turn, then every allocation in turn. Each case must give the failure's
+// result, log exactly the failure's messages, each once, and leave nothing
+// of the platform unreleased.
+#include <algorithm>
+#include <map>
+#include <new>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "allocation_failure.h"
+#include "appliance.h"
+#include "block_nodes.h"
+#include "korv_standin.h"
+#include "korvsnmp/parse_data.h"
+#include "platform_test.h"
+#include "syslog_capture.h"
+
+namespace {
+
+using korvstandin::Fault;
+using korvstandin::Op;
+
+enum class Result { True, False, Threw };
+
+// What one run of the road gives: its result, the result's members and the
+// messages, each as "<unit> <text>".
+struct Outcome {
+    Result result = Result::True;
+    std::set<std::string> members;
+    std::vector<std::string> messages;
+    Json::Value value{};  // the result itself; not compared
+};
+
+std::ostream &operator<<(std::ostream &out, const Outcome &outcome)
+{
+    static const char *const kResults[] = {"true", "false", "std::bad_alloc"};
+    out << kResults[static_cast<int>(outcome.result)] << " {";
+    for (const std::string &member : outcome.members)
+        out << ' ' << member;
+    out << " }";
+    for (const std::string &message : outcome.messages)
+        out << " [" << message << ']';
+    return out;
+}
+
+bool operator==(const Outcome &a, const Outcome &b)
+{
+    return a.result == b.result && a.members == b.members && a.messages == b.messages;
+}
+
+const std::set<std::string> kAllMembers = {"cpu", "disk", "lun", "memory", "network", "nfs", "space", "time"};
+// Members present when the named fill-in fails: those before it, and its own
+// (created null, and left so except by the network section).
+const std::set<std::string> kUpToNetwork = {"cpu", "memory", "network"};
+const std::set<std::string> kUpToDisk = {"cpu", "memory", "network", "disk=null"};
+const std::set<std::string> kUpToSpace = {"cpu", "memory", "network", "disk", "space=null"};
+
+// "<unit>:<line> <text>" as "<unit> <text>".
+std::string WithoutLine(const std::string &message)
+{
+    const size_t colon = message.find(':');
+    const size_t space = message.find(' ', colon);
+    if (colon == std::string::npos || space == std::string::npos)
+        return message;
+    return message.substr(0, colon) + message.substr(space);
+}
+
+// The argument `index` of a journal entry "Name(a, b, c)".
+std::string JournalArgument(const std::string &entry, size_t index)
+{
+    std::string arguments = entry.substr(entry.find('(') + 1);
+    arguments.pop_back();
+    for (size_t i = 0; i < index; ++i)
+        arguments = arguments.substr(arguments.find(", ") + 2);
+    return arguments.substr(0, arguments.find(", "));
+}
+
+// What failing the call of `op` whose journal entry is `entry` must give.
+Outcome FailedCallOutcome(Op op, const std::string &entry)
+{
+    switch (op) {
+    case Op::KLIBNetGetInterfaceInfo:
+        return {Result::False, kUpToNetwork,
+                {"fill_in_current_network Failed to get net interface, errno=0xD01"}};
+    case Op::DiskInfoEnum:
+        return {Result::False, kUpToDisk, {"fill_in_current_disk_io Failed to enum disks"}};
+    case Op::KORVEBoxInfoEnum:
+        return {Result::False, kUpToDisk, {"fill_in_current_disk_io Failed to enum ebox"}};
+    case Op::KORVUSBDevEnum:
+        return {Result::False, kUpToDisk,
+                {JournalArgument(entry, 1) == "(null)"
+                     ? "fill_in_current_disk_io Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE"
+                     : "fill_in_current_disk_io KORVExternalDevEnum: Error KORVUSBDevEnum"}};
+    case Op::KORVSpaceInfoEnum:
+        return {Result::False, kUpToSpace, {"fill_in_current_space_io Failed to enum space info"}};
+    case Op::KLIBCSzHashSetValue:
+        // The stand-in's last error: code, "standin" and the operation's index.
+        return {Result::True, kAllMembers, {"fill_in_current_disk_io KLIBCSzHashSetValue failed[0x0D01 standin:4]"}};
+    case Op::KLIBCFileGetSectionValue:
+        return {Result::True, kAllMembers,
+                {"fill_in_current_disk_io Fail to get text [volume:" + JournalArgument(entry, 2) + "]"}};
+    case Op::APIRunnerExec:
+        return {Result::True, kAllMembers, {"fill_in_current_lun_io Failed to list LUNs"}};
+    case Op::JsonArrayHasString:  // "all" not found: nothing is selected
+        return {Result::True, {"time"}, {}};
+    default:  // a failure that the road passes over silently
+        return {Result::True, kAllMembers, {}};
+    }
+}
+
+const Op kListOperations[] = {Op::DiskInfoEnum, Op::KORVEBoxInfoEnum, Op::KORVSpaceInfoEnum,
+                              Op::KORVFlashCacheConfigGet};
+
+class FaultSweep : public korvtest::PlatformTest {
+protected:
+    void SetUp() override
+    {
+        PlatformTest::SetUp();
+        const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
+        std::string whyNot;
+        if (!nodes_.Make(static_cast<size_t>(shape.spaces), whyNot))
+            GTEST_SKIP() << whyNot;
+        std::vector<korvexample::SpaceDevice> devices;
+        for (size_t i = 0; i < static_cast<size_t>(shape.spaces); ++i)
+            devices.push_back({nodes_.Node(i), nodes_.Name(i)});
+        appliance_ = korvexample::MakeAppliance(shape, devices);
+
+        Describe();
+        korvstandin::SetJournal(true);
+        baseline_ = Run();
+        for (const std::string &entry : korvstandin::Journal())
+            journal_[entry.substr(0, entry.find('('))].push_back(entry);
+    }
+    void TearDown() override
+    {
+        PlatformTest::TearDown();
+        korvstandin::Reset();
+    }
+
+    void Describe()
+    {
+        korvstandin::Reset();
+        korvstandin::Host() = appliance_.host;
+        korvtest::ClearLog();
+    }
+
+    // Runs the road on the described appliance; `Seam` (an allocation
+    // count or failure) lives for the library's call only.
+    struct NoSeam {
+        void Stop() {}
+    };
+    template <typename Seam = NoSeam, typename... SeamArgs>
+    Outcome Run(std::optional<Seam> *seam = nullptr, SeamArgs... args)
+    {
+        Outcome outcome;
+        const Json::Value request(Json::objectValue);
+        Json::Value result(Json::objectValue);
+        try {
+            if (seam != nullptr)
+                seam->emplace(args...);
+            outcome.result = SNMPParseReplyData(request, appliance_.reply, result) ? Result::True
+                                                                                   : Result::False;
+        } catch (const std::bad_alloc &) {
+            outcome.result = Result::Threw;
+        }
+        if (seam != nullptr)
+            (*seam)->Stop();
+        for (const std::string &member : result.getMemberNames())
+            outcome.members.insert(member + (result[member].isNull() ? "=null" : ""));
+        outcome.value = result;
+        for (const korvtest::LogEntry &entry : korvtest::LoggedMessages())
+            outcome.messages.push_back(WithoutLine(entry.text));
+        return outcome;
+    }
+
+    // The journal entry of the `call`-th call of `op` in the run without failures.
+    std::string Entry(Op op, int call) { return journal_[korvstandin::OpName(op)].at(call - 1); }
+
+    korvtest::BlockNodes nodes_;
+    korvexample::Appliance appliance_;
+    Outcome baseline_;
+    std::map<std::string, std::vector<std::string>> journal_;
+};
+
+TEST_F(FaultSweep, EveryPlatformCallFailedInTurn)
+{
+    ASSERT_EQ(baseline_, (Outcome{Result::True, kAllMembers, {}}));
+    int cases = 0;
+    for (int index = 0; index < static_cast<int>(Op::Count_); ++index) {
+        const Op op = static_cast<Op>(index);
+        const int calls = static_cast<int>(journal_[korvstandin::OpName(op)].size());
+        for (int call = 1; call <= calls; ++call, ++cases) {
+            SCOPED_TRACE(Entry(op, call) + " failing, call " + std::to_string(call));
+            Describe();
+            korvstandin::SetFault(op, Fault::Fail, korvstandin::kOutOfMemoryError,
+                                  korvstandin::Calls::Only(call));
+            EXPECT_EQ(Run(), FailedCallOutcome(op, Entry(op, call)));
+            EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
+        }
+    }
+    for (Op op : kListOperations) {
+        SCOPED_TRACE(std::string(korvstandin::OpName(op)) + " failing with a list");
+        Describe();
+        korvstandin::SetFault(op, Fault::FailLeavingList);
+        EXPECT_EQ(Run(), FailedCallOutcome(op, Entry(op, 1)));
+        EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
+    }
+    EXPECT_GT(cases, 50);
+    std::printf("[ sweep    ] %d platform calls failed in turn\n", cases);
+}
+
+TEST_F(FaultSweep, EveryAllocationFailedInTurn)
+{
+    Describe();
+    std::optional<korvtest::AllocationCount> count;
+    EXPECT_EQ(Run(&count), baseline_);
+    const long allocations = count->Count();
+    const Outcome eboxWrapper = {Result::True, kAllMembers,
+                                 {"fill_in_current_disk_io Failed to allocate ebox wrapper"}};
+    const Outcome deviceBlock = {Result::False, kUpToDisk,
+                                 {"fill_in_current_disk_io KORVExternalDevEnum error: Out of Memory"}};
+    int eboxWrappers = 0, deviceBlocks = 0, platformCalls = 0, thrown = 0;
+    for (long nth = 1; nth <= allocations; ++nth) {
+        SCOPED_TRACE("allocation " + std::to_string(nth) + " of " + std::to_string(allocations));
+        Describe();
+        std::optional<korvtest::AllocationFailure> failure;
+        const Outcome outcome = Run(&failure, nth);
+        ASSERT_TRUE(failure->Failed());
+        const bool nothrow = failure->FailedNothrow();
+        EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
+        const std::vector<korvstandin::CallRef> &platform = korvstandin::OutOfMemoryCalls();
+        if (!platform.empty()) {  // inside the platform: that call fails
+            ASSERT_EQ(platform.size(), 1u);
+            EXPECT_EQ(outcome, FailedCallOutcome(platform[0].op, Entry(platform[0].op, platform[0].call)));
+            ++platformCalls;
+        } else if (nothrow) {  // the library's own non-throwing allocations
+            EXPECT_TRUE(outcome == eboxWrapper || outcome == deviceBlock) << outcome;
+            eboxWrappers += outcome == eboxWrapper;
+            deviceBlocks += outcome == deviceBlock;
+        } else {
+            EXPECT_EQ(outcome.result, Result::Threw) << outcome;
+            EXPECT_THAT(outcome.messages, ::testing::IsEmpty());
+            ++thrown;
+        }
+    }
+    const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
+    EXPECT_EQ(eboxWrappers, shape.expansionUnits);
+    EXPECT_EQ(deviceBlocks, 2);  // USB, then eSATA
+    EXPECT_GT(platformCalls, 0);
+    EXPECT_GT(thrown, 0);
+    std::printf("[ sweep    ] %ld allocations: %d in the platform, %d thrown through the library\n",
+                allocations, platformCalls, thrown);
+}
+
+// The devices of a result section: "network" records, or "disk" records.
+std::set<std::string> Devices(const Json::Value &records)
+{
+    std::set<std::string> devices;
+    for (const Json::Value &record : records)
+        devices.insert(record["device"].asString());
+    return devices;
+}
+
+struct MalformedCase {
+    const char *name;
+    void (*arrange)(korvstandin::HostDescription &host, Json::Value &data);
+    Outcome expected;
+    void (*check)(const Json::Value &result);  // may be null
+};
+
+Json::Value Traffic(const std::string &device)
+{
+    Json::Value record(Json::objectValue);
+    record["device"] = device;
+    record["rx"] = 1;
+    record["tx"] = 2;
+    return record;
+}
+
+korvstandin::NetInterface *Find(korvstandin::HostDescription &host, korvstandin::NetRole role)
+{
+    for (korvstandin::NetInterface &entry : host.interfaces)
+        if (entry.role == role)
+            return &entry;
+    return nullptr;
+}
+
+const MalformedCase kMalformed[] = {
+    {"NameFillsItsFieldWithoutNul",
+     [](korvstandin::HostDescription &host, Json::Value &data) {
+         host.unterminatedFields = true;
+         host.interfaces.push_back({"abcdefghijklmnop"});
+         data["Network"].append(Traffic("abcdefghijklmnop"));
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_EQ(Devices(result["network"]).count("abcdefghijklmnop"), 1u); }},
+    {"MoreThan32Interfaces",
+     [](korvstandin::HostDescription &host, Json::Value &data) {
+         for (int i = 0; i < 40; ++i) {
+             host.interfaces.push_back({"x" + std::to_string(100 + i)});
+             data["Network"].append(Traffic("x" + std::to_string(100 + i)));
+         }
+         host.interfaceCountClaim = static_cast<int>(host.interfaces.size());
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_LE(result["network"].size(), 1u + 32u + 1u + 1u); }},
+    {"MemberCountBeyondSlots",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         Find(host, korvstandin::NetRole::Aggregation)->memberCountClaim = 1000;
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_EQ(Devices(result["network"]).count("bond0"), 1u); }},
+    {"MemberCountNegative",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         Find(host, korvstandin::NetRole::Aggregation)->memberCountClaim = -2;
+     },
+     {Result::True, kAllMembers, {}},
+     [](const Json::Value &result) { EXPECT_EQ(Devices(result["network"]).count("bond0"), 0u); }},
+    {"DeviceCountBeyondItsBlock",
+     [](korvstandin::HostDescription &host, Json::Value &) { host.usb.countClaim = 1000; },
+     {Result::True, kAllMembers, {}},
+     nullptr},
+    {"FlashCacheWithoutSpacePath",
+     [](korvstandin::HostDescription &host, Json::Value &) { host.flashCaches[0].spacePath.reset(); },
+     {Result::True, kAllMembers, {}},
+     nullptr},
+    {"FlashCacheWithoutVolumePath",
+     [](korvstandin::HostDescription &host, Json::Value &) { host.flashCaches[0].volumePath.reset(); },
+     {Result::True, kAllMembers, {}},
+     nullptr},
+    {"NullErrorFile",
+     [](korvstandin::HostDescription &host, Json::Value &) {
+         host.nullErrorFile = true;
+         korvstandin::SetFault(Op::KLIBCSzHashSetValue, Fault::Fail, 0x0042, korvstandin::Calls::Only(1));
+     },
+     {Result::True, kAllMembers, {"fill_in_current_disk_io KLIBCSzHashSetValue failed[0x0042 :4]"}},
+     nullptr},
+};
+
+TEST_F(FaultSweep, MalformedPlatformAnswers)
+{
+    const korvexample::Appliance wellFormed = appliance_;
+    for (const MalformedCase &c : kMalformed) {
+        SCOPED_TRACE(c.name);
+        appliance_ = wellFormed;
+        Describe();
+        c.arrange(korvstandin::Host(), appliance_.reply["data"]);
+        const Outcome outcome = Run();
+        EXPECT_EQ(outcome, c.expected);
+        if (c.check != nullptr)
+            c.check(outcome.value);
+        EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
+    }
+}
+
+}  // namespace

@@ -1,0 +1,214 @@
+// Host description files: a good file answers as the same description in
+// memory; a bad one makes every operation fail, with one message that names
+// the file and the member, and never a crash.
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <fstream>
+#include <sstream>
+#include <string>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "appliance.h"
+#include "block_nodes.h"
+#include "host_file.h"
+#include "json_text.h"
+#include "korvsnmp/parse_data.h"
+#include "platform_test.h"
+#include "syslog_capture.h"
+
+namespace {
+
+using korvtest::Logged;
+using ::testing::ElementsAre;
+
+// A host file in a temporary directory, named to the stand-in through the
+// environment for the test's lifetime.
+class HostFileTest : public korvtest::PlatformTest {
+protected:
+    void SetUp() override
+    {
+        PlatformTest::SetUp();
+        char pattern[] = "/tmp/korvsnmp-host-XXXXXX";
+        ASSERT_NE(mkdtemp(pattern), nullptr);
+        directory_ = pattern;
+        path_ = directory_ + "/host.json";
+    }
+    void TearDown() override
+    {
+        unsetenv(korvstandin::kHostFileVariable);
+        std::remove(path_.c_str());
+        rmdir(directory_.c_str());
+        PlatformTest::TearDown();
+        korvstandin::Reset();
+    }
+
+    // Writes `text` as the host file and lets the next platform call read it.
+    void UseHostFile(const std::string &text)
+    {
+        std::ofstream(path_, std::ios::binary | std::ios::trunc) << text;
+        setenv(korvstandin::kHostFileVariable, path_.c_str(), 1);
+        korvstandin::UseProcessHost();
+        korvtest::ClearLog();
+    }
+
+    std::string directory_;
+    std::string path_;
+};
+
+TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
+{
+    const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
+    korvtest::BlockNodes nodes;
+    std::string whyNot;
+    if (!nodes.Make(static_cast<size_t>(shape.spaces), whyNot))
+        GTEST_SKIP() << whyNot;
+    std::vector<korvexample::SpaceDevice> devices;
+    for (size_t i = 0; i < static_cast<size_t>(shape.spaces); ++i)
+        devices.push_back({nodes.Node(i), nodes.Name(i)});
+    const korvexample::Appliance appliance = korvexample::MakeAppliance(shape, devices);
+    const Json::Value request(Json::objectValue);
+
+    korvstandin::Host() = appliance.host;
+    Json::Value inMemory;
+    ASSERT_TRUE(SNMPParseReplyData(request, appliance.reply, inMemory));
+
+    UseHostFile(korvstandin::HostFileText(appliance.host));
+    Json::Value fromFile;
+    ASSERT_TRUE(SNMPParseReplyData(request, appliance.reply, fromFile));
+
+    EXPECT_EQ(korvtest::JsonText(fromFile), korvtest::JsonText(inMemory));
+    EXPECT_FALSE(fromFile["space"]["volume"].empty());  // the nodes resolved: spaces are named
+    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
+}
+
+TEST_F(HostFileTest, WrittenDescriptionReadsBackTheSame)
+{
+    const korvexample::ApplianceShape shape = korvexample::LargeAppliance();
+    const korvexample::Appliance appliance =
+        korvexample::MakeAppliance(shape, korvexample::ApplianceSpaceDevices(shape.spaces));
+    const std::string text = korvstandin::HostFileText(appliance.host);
+    korvstandin::HostDescription read;
+    std::string error;
+    ASSERT_TRUE(korvstandin::ParseHostDescription(text, read, error)) << error;
+    EXPECT_EQ(korvstandin::HostFileText(read), text);
+}
+
+TEST_F(HostFileTest, LargeApplianceExampleFilesMatch)
+{
+    std::ifstream replyFile(KORVSNMP_EXAMPLES_DIR "/large-appliance.reply.json");
+    std::stringstream replyText;
+    replyText << replyFile.rdbuf();
+    const Json::Value reply = korvtest::ParseJson(replyText.str());
+    std::ifstream hostFile(KORVSNMP_EXAMPLES_DIR "/large-appliance.host.json");
+    std::stringstream hostText;
+    hostText << hostFile.rdbuf();
+    UseHostFile(hostText.str());
+
+    Json::Value result;
+    ASSERT_TRUE(SNMPParseReplyData(Json::Value(Json::objectValue), reply, result));
+    EXPECT_EQ(result["disk"]["disk"].size(), 72u);
+    EXPECT_EQ(result["network"].size(), 1u + 30u + 2u + 1u);  // total, listed, aggregations, PPPoE
+    EXPECT_EQ(result["lun"][511]["lun_name"].asString(), "LUN-512");
+    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
+}
+
+struct BadFile {
+    const char *name;
+    std::string text;
+    const char *error;  // what the message says after the file's path
+};
+
+std::string Interfaces(int count)
+{
+    std::string text = R"({"interfaces": [)";
+    for (int i = 0; i < count; ++i)
+        text += (i ? "," : "") + std::string(R"({"name": "eth)") + std::to_string(i) + "\"}";
+    return text + "]}";
+}
+
+std::string Members(int count)
+{
+    std::string list;
+    for (int i = 0; i < count; ++i)
+        list += (i ? ",\"e" : "\"e") + std::to_string(i) + "\"";
+    return list;
+}
+
+const BadFile kBadFiles[] = {
+    {"NotJson", "{\"disks\": [", "not JSON: * Line 1, Column 12"},
+    {"TrailingGarbage", "{} {}", "not JSON: * Line 1, Column 4"},
+    {"NotAnObject", "[]", "top level: not an object"},
+    {"UnknownMember", R"({"interface": []})", "interface: unknown member"},
+    {"ListIsAnObject", R"({"interfaces": {}})", "interfaces: not an array"},
+    {"NumberAsText", R"({"disks": [{"number": "1", "container": "internal", "device_path": "/dev/sda"}]})",
+     "disks[0].number: not an integer from -2147483648 to 2147483647"},
+    {"NegativeMemory", R"({"memory_size": -1})", "memory_size: not an unsigned 32-bit integer"},
+    {"MissingMember", R"({"spaces": [{"name": "volume1"}]})", "spaces[0]: member \"device_path\" missing"},
+    {"UnknownRole", R"({"interfaces": [{"name": "br0", "role": "bridge"}]})",
+     "interfaces[0].role: unknown role \"bridge\" (plain, vlan, aggregation or ovs_master)"},
+    {"UnknownContainer", R"({"disks": [{"number": 1, "container": "tray", "device_path": "/dev/sda"}]})",
+     "disks[0].container: unknown container \"tray\" (internal, ebox or ssd_cache)"},
+    {"PathLongerThanItsField",
+     R"({"disks": [{"number": 1, "container": "internal", "device_path": "/dev/)" + std::string(59, 'x') + "\"}]})",
+     "disks[0].device_path: longer than 63 characters"},
+    {"NameLongerThanItsField", R"({"interfaces": [{"name": "eth0123456789abc"}]})",
+     "interfaces[0].name: longer than 15 characters"},
+    {"TooManyMembers", R"({"interfaces": [{"name": "bond0", "role": "aggregation", "members": [)" +
+                           Members(33) + "]}]}",
+     "interfaces[0].members: 33 elements, more than 32"},
+    {"TenThousandInterfaces", Interfaces(10000), "interfaces: 10000 elements, more than 256"},
+    {"DeeplyNested", std::string(100000, '[') + std::string(100000, ']'), "not JSON: "},
+};
+
+class BadHostFile : public HostFileTest, public ::testing::WithParamInterface<BadFile> {};
+
+TEST_P(BadHostFile, EveryOperationFailsWithOneMessage)
+{
+    UseHostFile(GetParam().text);
+
+    KLIBNetInterfaceInfo records[4] = {};
+    EXPECT_EQ(KLIBNetGetInterfaceInfo(records, 4, 6), -1);
+    DiskFilter filter{DISK_CONTAINER_INTERNAL};
+    DiskInfoList *disks = nullptr;
+    EXPECT_EQ(DiskInfoEnum(&filter, &disks), -1);
+    EXPECT_EQ(disks, nullptr);
+    EXPECT_EQ(KLIBSystemPhysMemSizeGet(), 0u);
+    char text[64] = {};
+    EXPECT_EQ(KLIBCFileGetSectionValue(korvstandin::kStringsFilePath, "volume", "volume_disk", text,
+                                       sizeof text),
+              -1);
+    Json::Value response;
+    EXPECT_LT(KORV::APIRunner::Exec(response, "KORV.Core.ISCSI.LUN", 1, "list", Json::Value(), "admin"), 0);
+    EXPECT_FALSE(response["success"].asBool());
+
+    ASSERT_EQ(korvtest::LoggedMessages().size(), 1u);
+    const std::string expected = "Host description " + path_ + ": " + GetParam().error;
+    const std::string &message = korvtest::LoggedMessages()[0].text;
+    EXPECT_EQ(korvtest::LoggedMessages()[0].priority, LOG_ERR);
+    EXPECT_THAT(message, ::testing::StartsWith("korvplatform:"));
+    EXPECT_THAT(message, ::testing::HasSubstr(expected)) << message;
+    EXPECT_THAT(message, ::testing::EndsWith("; every platform operation fails"));
+}
+
+INSTANTIATE_TEST_SUITE_P(Files, BadHostFile, ::testing::ValuesIn(kBadFiles),
+                         [](const auto &info) { return std::string(info.param.name); });
+
+TEST_F(HostFileTest, UnreadableFileFailsEveryOperation)
+{
+    setenv(korvstandin::kHostFileVariable, (directory_ + "/absent.json").c_str(), 1);
+    korvstandin::UseProcessHost();
+    korvtest::ClearLog();
+
+    EXPECT_EQ(KORVPPPoeIntfGet(nullptr, 0), -1);
+    EXPECT_EQ(SupportEBox(), 0);
+    EXPECT_THAT(korvtest::LoggedMessages(),
+                ElementsAre(Logged(LOG_ERR, "korvplatform",
+                                   "Host description " + directory_ +
+                                       "/absent.json: cannot be opened; every platform operation fails")));
+}
+
+}  // namespace
