@@ -104,7 +104,8 @@ TEST_F(KorvsnmpcdCrowd, WellFormedRequestsAreAnsweredPromptlyAmidThousandsOfHost
     Clock::time_point start = Clock::now();
     {
         ClientCrowd clients(path_, size);
-        ASSERT_TRUE(Eventually([&] { return clients.Connected() >= crowd; }))
+        // Garbage senders are closed and come back all the time; the idle ones stay.
+        ASSERT_TRUE(Eventually([&] { return clients.Connected() >= size.idle; }))
             << clients.Connected() << " of " << crowd << " connected";
 
         std::vector<std::chrono::microseconds> latencies;
