@@ -12,7 +12,9 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <map>
@@ -64,24 +66,20 @@ private:
 // A child process, stopped by its id (SIGTERM, then waited for).
 class Child {
 public:
-    // Runs `argv` with this process's environment plus `variables`
-    // ("NAME=value", taking the place of a variable of the same name).
+    // Runs `argv` with this process's environment, `variables` ("NAME=value")
+    // taking the place of their namesakes.
     Child(const std::vector<std::string> &argv, const std::string &output,
-          const std::vector<std::string> &variables = {})
+          std::vector<std::string> variables = {})
     {
-        std::vector<std::string> environment = variables;
-        for (char **variable = environ; *variable != nullptr; ++variable) {
-            const std::string entry = *variable;
-            const std::string name = entry.substr(0, entry.find('=') + 1);
-            bool replaced = false;
-            for (const std::string &own : variables)
-                replaced = replaced || own.compare(0, name.size(), name) == 0;
-            if (!replaced)
-                environment.push_back(entry);
-        }
         std::vector<char *> envp;
-        for (std::string &entry : environment)
-            envp.push_back(entry.data());
+        for (std::string &variable : variables)
+            envp.push_back(variable.data());
+        for (char **variable = environ; *variable != nullptr; ++variable) {
+            const std::string_view name(*variable, std::strcspn(*variable, "=") + 1);
+            if (std::none_of(variables.begin(), variables.end(),
+                             [name](const std::string &own) { return own.compare(0, name.size(), name) == 0; }))
+                envp.push_back(*variable);
+        }
         envp.push_back(nullptr);
         posix_spawn_file_actions_t actions;
         posix_spawn_file_actions_init(&actions);
@@ -362,7 +360,7 @@ protected:
 
     std::string Client(const std::string &tool, const std::string &arguments) const
     {
-        return RunCommand(tool + " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB " +
+        return RunCommand("SNMP_PERSISTENT_DIR=" + scratch_.Path() + "/client " + tool + " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB " +
                    "-Os -OQ -Oe -OU 127.0.0.1:" + std::to_string(port_) + " " + arguments);
     }
 
