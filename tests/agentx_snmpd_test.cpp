@@ -12,7 +12,9 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <map>
@@ -64,24 +66,20 @@ private:
 // A child process, stopped by its id (SIGTERM, then waited for).
 class Child {
 public:
-    // Runs `argv` with this process's environment plus `variables`
-    // ("NAME=value", taking the place of a variable of the same name).
+    // Runs `argv` with this process's environment, `variables` ("NAME=value")
+    // taking the place of their namesakes.
     Child(const std::vector<std::string> &argv, const std::string &output,
-          const std::vector<std::string> &variables = {})
+          std::vector<std::string> variables = {})
     {
-        std::vector<std::string> environment = variables;
-        for (char **variable = environ; *variable != nullptr; ++variable) {
-            const std::string entry = *variable;
-            const std::string name = entry.substr(0, entry.find('=') + 1);
-            bool replaced = false;
-            for (const std::string &own : variables)
-                replaced = replaced || own.compare(0, name.size(), name) == 0;
-            if (!replaced)
-                environment.push_back(entry);
-        }
         std::vector<char *> envp;
-        for (std::string &entry : environment)
-            envp.push_back(entry.data());
+        for (std::string &variable : variables)
+            envp.push_back(variable.data());
+        for (char **variable = environ; *variable != nullptr; ++variable) {
+            const std::string_view name(*variable, std::strcspn(*variable, "=") + 1);
+            if (std::none_of(variables.begin(), variables.end(),
+                             [name](const std::string &own) { return own.compare(0, name.size(), name) == 0; }))
+                envp.push_back(*variable);
+        }
         envp.push_back(nullptr);
         posix_spawn_file_actions_t actions;
         posix_spawn_file_actions_init(&actions);
@@ -214,10 +212,9 @@ Json::Value DescribedReply(const korvtest::BlockNodes &nodes, unsigned time, uns
             "cached": 200000, "total_swap": 1048576, "avail_swap": 1000000})"));
     for (const char *device : {"eth1", "eth0", "eth0.10", "bond0", "eth9", "ppp0"}) {
         Json::Value counters = record(device);
-        data["Network"].append(Json::Value(Json::objectValue));
-        data["Network"][data["Network"].size() - 1]["device"] = device;
-        data["Network"][data["Network"].size() - 1]["rx"] = counters["read_byte"];
-        data["Network"][data["Network"].size() - 1]["tx"] = counters["write_byte"];
+        data["Network"].append(korvtest::ParseJson(R"({"device": ")" + std::string(device) + R"(", "rx": )" +
+                                                   counters["read_byte"].asString() + R"(, "tx": )" +
+                                                   counters["write_byte"].asString() + "}"));
     }
     for (const char *device : {"sdc", "sda", "sdz", "sdu"})
         data["DiskIO"].append(record(device));
@@ -264,34 +261,26 @@ std::map<std::string, std::string> ExpectedObjects(const Json::Value &result)
          {std::tuple("korvDisk", "disk", "korvDiskTotal"), std::tuple("korvVolume", "space", "korvVolumeTotal")})
         for (const auto &[suffix, member] : counters)
             objects[std::string(total) + suffix + ".0"] = number(result[section]["total"][member]);
-    const std::map<std::string, int> diskTypes = {{"internal", 1}, {"ebox", 2}, {"usb", 3}, {"eSATA", 4}};
+    const std::map<std::string, std::string> diskTypes = {{"internal", "1"}, {"ebox", "2"}, {"usb", "3"}, {"eSATA", "4"}};
+    const std::tuple<std::string, Json::Value, const char *, const char *, const char *, const char *> tables[] = {
+        {"korvDisk", result["disk"]["disk"], "device", "Device", "display_name", "DisplayName"},
+        {"korvVolume", result["space"]["volume"], "device", "Device", "display_name", "DisplayName"},
+        {"korvLun", result["lun"], "uuid", "Uuid", "lun_name", "Name"}};
+    for (const auto &[table, rows, key, keyObject, name, nameObject] : tables) {
+        int row = 0;
+        for (const Json::Value &record : rows) {
+            const std::string index = "." + std::to_string(++row);
+            objects[table + keyObject + index] = text(record[key]);
+            objects[table + nameObject + index] = text(record[name]);
+            for (const auto &[suffix, member] : counters)
+                objects[table + suffix + index] = number(record[member]);
+            if (table == "korvDisk") {
+                auto type = diskTypes.find(record["type"].asString());
+                objects["korvDiskType" + index] = type == diskTypes.end() ? "5" : type->second;
+            }
+        }
+    }
     int row = 0;
-    for (const Json::Value &disk : result["disk"]["disk"]) {
-        const std::string index = "." + std::to_string(++row);
-        objects["korvDiskDevice" + index] = text(disk["device"]);
-        objects["korvDiskDisplayName" + index] = text(disk["display_name"]);
-        auto type = diskTypes.find(disk["type"].asString());
-        objects["korvDiskType" + index] = std::to_string(type == diskTypes.end() ? 5 : type->second);
-        for (const auto &[suffix, member] : counters)
-            objects["korvDisk" + std::string(suffix) + index] = number(disk[member]);
-    }
-    row = 0;
-    for (const Json::Value &volume : result["space"]["volume"]) {
-        const std::string index = "." + std::to_string(++row);
-        objects["korvVolumeDevice" + index] = text(volume["device"]);
-        objects["korvVolumeDisplayName" + index] = text(volume["display_name"]);
-        for (const auto &[suffix, member] : counters)
-            objects["korvVolume" + std::string(suffix) + index] = number(volume[member]);
-    }
-    row = 0;
-    for (const Json::Value &lun : result["lun"]) {
-        const std::string index = "." + std::to_string(++row);
-        objects["korvLunUuid" + index] = text(lun["uuid"]);
-        objects["korvLunName" + index] = text(lun["lun_name"]);
-        for (const auto &[suffix, member] : counters)
-            objects["korvLun" + std::string(suffix) + index] = number(lun[member]);
-    }
-    row = 0;
     for (const Json::Value &interface : result["network"]) {
         const std::string index = "." + std::to_string(++row);
         objects["korvIfDevice" + index] = text(interface["device"]);
@@ -362,7 +351,7 @@ protected:
 
     std::string Client(const std::string &tool, const std::string &arguments) const
     {
-        return RunCommand(tool + " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB " +
+        return RunCommand("SNMP_PERSISTENT_DIR=" + scratch_.Path() + "/client " + tool + " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB " +
                    "-Os -OQ -Oe -OU 127.0.0.1:" + std::to_string(port_) + " " + arguments);
     }
 
