@@ -18,7 +18,8 @@ socket=/tmp/korvsnmpcd.sock
 pidfile=$PWD/build/korvsnmpcd.pid
 stat=build/tools/stat/korvsnmp-stat
 collector=build/tools/korvsnmpcd/korvsnmpcd
-packages="ca-certificates cmake make g++ pkg-config libjsoncpp-dev libgtest-dev libgmock-dev libbenchmark-dev"
+packages="ca-certificates cmake make g++ pkg-config libjsoncpp-dev libgtest-dev libgmock-dev libbenchmark-dev
+    libsnmp-dev"
 
 simulate=
 if [ "${1:-}" = --simulate ]; then

@@ -171,10 +171,10 @@ def main():
             children.append(snmpd)
             poll("snmpd", lambda: os.path.exists(scratch + "/agentx.sock"))
 
-            def start_agentx(collector_socket, interval):
+            def start_agentx(collector_socket, interval, host=None):
                 agent_env = dict(os.environ, LD_PRELOAD=SHIM, KORVTEST_COLLECTOR_SOCKET=collector_socket)
-                if options.host:
-                    agent_env["KORVPLATFORM_HOST"] = options.host
+                if host:
+                    agent_env["KORVPLATFORM_HOST"] = os.path.abspath(host)
                 agent = subprocess.Popen([AGENTX, "--agentx-socket", scratch + "/agentx.sock",
                                           "--interval", str(interval), "--persistent-dir",
                                           scratch + "/agentx-state"], env=agent_env,
@@ -220,7 +220,7 @@ def main():
             reply = json.load(open(options.reply)) if options.reply else large_reply()
             big_socket = scratch + "/big.sock"
             big = Responder(big_socket, reply)
-            agent = start_agentx(big_socket, 3600)
+            agent = start_agentx(big_socket, 3600, options.host)
             poll("the first large sample", lambda: big.answered >= 1 and
                  "korvSampleTime.0 = Gauge32: 1795000001" in snmp("snmpget", port, "korvSampleTime.0"))
             before = cpu_ticks(agent.pid)
@@ -235,6 +235,9 @@ def main():
                   " resident memory %d KiB"
                   % (len(json.dumps(reply)), objects, ticks * 1000.0 / hz / options.samples,
                      options.samples, rss_kib(agent.pid)))
+            median, p99, lines = walk_latencies(port, 20, "snmpbulkwalk")
+            print("snmpbulkwalk of the large appliance (%d lines): median %.1f ms, p99 %.1f ms"
+                  % (lines, median * 1000, p99 * 1000))
             big.close()
         finally:
             for child in reversed(children):

@@ -14,6 +14,7 @@
 #include <korv_platform.h>
 
 #include "json_read.h"
+#include "json_take.h"
 #include "korvsnmp/fill_in_current_disk_io.h"
 #include "platform_text.h"
 #include "protocol/unit_log.h"
@@ -351,11 +352,10 @@ bool ReadDevice(const Json::Value &element, Json::ArrayIndex index, std::string 
     return true;
 }
 
-}  // namespace
-
-namespace KORVSNMP {
-
-bool FillInCurrentDiskIO(const Json::Value &diskIO, Json::Value &out)
+// `Records` is const Json::Value (the records are copied) or Json::Value
+// (they are moved out).
+template <typename Records>
+bool FillIn(Records &diskIO, Json::Value &out)
 {
     if (!diskIO.isArray())
         return false;
@@ -374,7 +374,7 @@ bool FillInCurrentDiskIO(const Json::Value &diskIO, Json::Value &out)
     Json::Value disks(Json::arrayValue);
     std::uint64_t sums[kCounterCount] = {};
     for (Json::ArrayIndex index = 0; index < diskIO.size(); ++index) {
-        const Json::Value &element = diskIO[index];
+        Records &element = diskIO[index];
         std::string device;
         if (!ReadDevice(element, index, device))
             return false;
@@ -382,7 +382,7 @@ bool FillInCurrentDiskIO(const Json::Value &diskIO, Json::Value &out)
         if (found == names.end() || found->second.displayName.empty())
             continue;
 
-        Json::Value record = element;
+        Json::Value record = korvsnmp::Take(element);
         record["display_name"] = found->second.displayName;
         record["type"] = found->second.type;
         for (size_t counter = 0; counter < kCounterCount; ++counter) {
@@ -410,5 +410,13 @@ bool FillInCurrentDiskIO(const Json::Value &diskIO, Json::Value &out)
     out["disk"] = std::move(disks);
     return true;
 }
+
+}  // namespace
+
+namespace KORVSNMP {
+
+bool FillInCurrentDiskIO(const Json::Value &diskIO, Json::Value &out) { return FillIn(diskIO, out); }
+
+bool FillInCurrentDiskIO(Json::Value &&diskIO, Json::Value &out) { return FillIn(diskIO, out); }
 
 }  // namespace KORVSNMP

@@ -20,6 +20,7 @@
 #include <korv_storage.h>
 
 #include "json_read.h"
+#include "json_take.h"
 #include "platform_text.h"
 #include "protocol/unit_log.h"
 
@@ -154,11 +155,10 @@ bool EnumSpaceNames(SpaceNameMap &names)
     return true;
 }
 
-}  // namespace
-
-namespace KORVSNMP {
-
-bool FillInCurrentSpaceIO(const Json::Value &spaceIO, Json::Value &space)
+// `Records` is const Json::Value (the records are copied) or Json::Value
+// (they are moved out).
+template <typename Records>
+bool FillIn(Records &spaceIO, Json::Value &space)
 {
     if (!spaceIO.isArray()) {
         KORVSNMP_LOG(LOG_ERR, "SpaceIO is not array.");
@@ -169,9 +169,9 @@ bool FillInCurrentSpaceIO(const Json::Value &spaceIO, Json::Value &space)
         return false;
 
     Json::Value volumes(Json::arrayValue);
-    const Json::Value *total = nullptr;
+    Records *total = nullptr;
     for (Json::ArrayIndex index = 0; index < spaceIO.size(); ++index) {
-        const Json::Value &record = spaceIO[index];
+        Records &record = spaceIO[index];
         if (!korvread::IsRecord(record)) {
             KORVSNMP_LOG(LOG_ERR, "SpaceIO element %u is not an object", index);
             return false;
@@ -189,7 +189,7 @@ bool FillInCurrentSpaceIO(const Json::Value &spaceIO, Json::Value &space)
         const auto named = names.find(deviceName);
         if (named == names.end() || named->second.empty())
             continue;
-        Json::Value volume = record;
+        Json::Value volume = korvsnmp::Take(record);
         volume[kDisplayNameKey] = named->second;
         volumes.append(std::move(volume));
     }
@@ -197,9 +197,20 @@ bool FillInCurrentSpaceIO(const Json::Value &spaceIO, Json::Value &space)
     if (!korvread::IsRecord(space))
         space = Json::Value(Json::objectValue);
     if (total != nullptr)
-        space[kTotalKey] = *total;
+        space[kTotalKey] = korvsnmp::Take(*total);
     space[kVolumeKey] = std::move(volumes);
     return true;
 }
+
+}  // namespace
+
+namespace KORVSNMP {
+
+bool FillInCurrentSpaceIO(const Json::Value &spaceIO, Json::Value &space)
+{
+    return FillIn(spaceIO, space);
+}
+
+bool FillInCurrentSpaceIO(Json::Value &&spaceIO, Json::Value &space) { return FillIn(spaceIO, space); }
 
 }  // namespace KORVSNMP

@@ -1,4 +1,7 @@
 // Assembly of the caller's statistics result from one collector reply.
+#include <type_traits>
+#include <utility>
+
 #include <json/value.h>
 #include <korv_webapi.h>
 
@@ -8,6 +11,7 @@
 #include "korvsnmp/fill_in_current_network.h"
 #include "korvsnmp/fill_in_current_space_io.h"
 #include "korvsnmp/parse_data.h"
+#include "json_take.h"
 #include "protocol/unit_log.h"
 
 namespace {
@@ -22,58 +26,70 @@ enum class Shape {
     Present,          // any value; the fill-in function judges its shape
 };
 
-// Takes a section that passed its test over into the result.
-using TakeOver = bool (*)(const Json::Value &section, Json::Value &result);
+// What is done with a section that passed its test.
+enum class Action { Cpu, Memory, Network, Disk, Space, Lun, Nfs };
 
 struct Section {
     const char *resource;  // the name that selects it in the request
     const char *member;    // its member of the reply's "data"
     Shape shape;
-    TakeOver takeOver;
+    Action action;
     const char *failure;   // logged when the section is missing or malformed
 };
 
 // In the order in which the result is filled.
 const Section kSections[] = {
-    {"cpu", "System", Shape::OneElementArray,
-     [](const Json::Value &section, Json::Value &result) {
-         result["cpu"] = section[0];
-         return true;
-     },
-     "Failed to get CPU data"},
-    {"memory", "Memory", Shape::OneElementArray,
-     [](const Json::Value &section, Json::Value &result) {
-         return KORVSNMP::FillInCurrentMemory(section[0], result["memory"]);
-     },
-     "Failed to get Memory data"},
-    {"network", "Network", Shape::NonEmptyArray,
-     [](const Json::Value &section, Json::Value &result) {
-         return KORVSNMP::FillInCurrentNetwork(section, result["network"]);
-     },
-     "Failed to get Network data"},
-    {"disk", "DiskIO", Shape::Present,
-     [](const Json::Value &section, Json::Value &result) {
-         return KORVSNMP::FillInCurrentDiskIO(section, result["disk"]);
-     },
-     "Failed to get DiskIO data"},
-    {"space", "SpaceIO", Shape::Present,
-     [](const Json::Value &section, Json::Value &result) {
-         return KORVSNMP::FillInCurrentSpaceIO(section, result["space"]);
-     },
-     "Failed to get SpaceIO data"},
-    {"lun", "iSCSI", Shape::Present,
-     [](const Json::Value &section, Json::Value &result) {
-         Json::Value &lun = result["lun"] = section;
-         return KORVSNMP::FillInCurrentLunIO(lun);
-     },
-     "Failed to get ISCSI data"},
-    {"nfs", "NFS", Shape::Present,
-     [](const Json::Value &section, Json::Value &result) {
-         result["nfs"] = section;
-         return true;
-     },
-     "Failed to get NFS data"},
+    {"cpu", "System", Shape::OneElementArray, Action::Cpu, "Failed to get CPU data"},
+    {"memory", "Memory", Shape::OneElementArray, Action::Memory, "Failed to get Memory data"},
+    {"network", "Network", Shape::NonEmptyArray, Action::Network, "Failed to get Network data"},
+    {"disk", "DiskIO", Shape::Present, Action::Disk, "Failed to get DiskIO data"},
+    {"space", "SpaceIO", Shape::Present, Action::Space, "Failed to get SpaceIO data"},
+    {"lun", "iSCSI", Shape::Present, Action::Lun, "Failed to get ISCSI data"},
+    {"nfs", "NFS", Shape::Present, Action::Nfs, "Failed to get NFS data"},
 };
+
+// Hands a reply section to a fill-in function that has a moving form.
+template <typename Data, typename FillIn>
+bool Hand(Data &section, Json::Value &out, FillIn fillIn)
+{
+    if constexpr (std::is_const_v<Data>)
+        return fillIn(section, out);
+    else
+        return fillIn(std::move(section), out);
+}
+
+// Takes `section` over into the result. `Data` is const Json::Value (the
+// reply is copied from) or Json::Value (the reply is taken apart).
+template <typename Data>
+bool TakeOver(Action action, Data &section, Json::Value &result)
+{
+    using korvsnmp::Take;
+    switch (action) {
+    case Action::Cpu:
+        result["cpu"] = Take(section[0]);
+        return true;
+    case Action::Memory:
+        return KORVSNMP::FillInCurrentMemory(std::as_const(section)[0], result["memory"]);
+    case Action::Network:
+        return KORVSNMP::FillInCurrentNetwork(std::as_const(section), result["network"]);
+    case Action::Disk:
+        return Hand(section, result["disk"], [](auto &&in, Json::Value &out) {
+            return KORVSNMP::FillInCurrentDiskIO(std::forward<decltype(in)>(in), out);
+        });
+    case Action::Space:
+        return Hand(section, result["space"], [](auto &&in, Json::Value &out) {
+            return KORVSNMP::FillInCurrentSpaceIO(std::forward<decltype(in)>(in), out);
+        });
+    case Action::Lun: {
+        Json::Value &lun = result["lun"] = Take(section);
+        return KORVSNMP::FillInCurrentLunIO(lun);
+    }
+    case Action::Nfs:
+        result["nfs"] = Take(section);
+        return true;
+    }
+    return false;
+}
 
 // `data` is an object or null.
 bool PassesTest(const Json::Value &data, const Section &section)
@@ -95,14 +111,17 @@ bool PassesTest(const Json::Value &data, const Section &section)
 // Member lookups by key are defined on objects and null only.
 bool IsObjectOrNull(const Json::Value &value) { return value.isObject() || value.isNull(); }
 
-bool Assemble(const Json::Value &request, const Json::Value &reply, Json::Value &result)
+// `Reply` is const Json::Value or Json::Value, as for TakeOver.
+template <typename Reply>
+bool Assemble(const Json::Value &request, Reply &reply, Json::Value &result)
 {
     if (!IsObjectOrNull(request) || !IsObjectOrNull(reply) || !IsObjectOrNull(result)) {
         KORVSNMP_LOG(LOG_ERR, "Request, reply and result must be JSON objects (types %d, %d, %d)",
                      request.type(), reply.type(), result.type());
         return false;
     }
-    const Json::Value &data = reply["data"];
+    Json::Value noData;
+    Reply &data = reply.isMember("data") ? reply["data"] : noData;
     if (!IsObjectOrNull(data)) {
         KORVSNMP_LOG(LOG_ERR, "Reply data is not a JSON object (type %d)", data.type());
         return false;
@@ -120,7 +139,7 @@ bool Assemble(const Json::Value &request, const Json::Value &reply, Json::Value 
             KORVSNMP_LOG(LOG_ERR, "%s", section.failure);
             return false;
         }
-        if (!section.takeOver(data[section.member], result))
+        if (!TakeOver(section.action, data[section.member], result))
             return false;  // the fill-in function has said why
     }
 
@@ -128,13 +147,16 @@ bool Assemble(const Json::Value &request, const Json::Value &reply, Json::Value 
         KORVSNMP_LOG(LOG_ERR, "Failed to get time data");
         return false;
     }
-    result["time"] = data["time"];
+    result["time"] = korvsnmp::Take(data["time"]);
     return true;
 }
 
 }  // namespace
 
-bool SNMPParseReplyData(const Json::Value &request, const Json::Value &reply, Json::Value &result)
+namespace {
+
+template <typename Reply>
+bool AssembleCaught(const Json::Value &request, Reply &reply, Json::Value &result)
 {
     try {
         return Assemble(request, reply, result);
@@ -143,4 +165,16 @@ bool SNMPParseReplyData(const Json::Value &request, const Json::Value &reply, Js
         KORVSNMP_LOG(LOG_ERR, "Failed to assemble the reply: %s", error.what());
         return false;
     }
+}
+
+}  // namespace
+
+bool SNMPParseReplyData(const Json::Value &request, const Json::Value &reply, Json::Value &result)
+{
+    return AssembleCaught(request, reply, result);
+}
+
+bool SNMPParseReplyData(const Json::Value &request, Json::Value &&reply, Json::Value &result)
+{
+    return AssembleCaught(request, reply, result);
 }

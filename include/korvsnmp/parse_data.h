@@ -14,4 +14,12 @@
 KORVSNMP_EXPORT bool SNMPParseReplyData(const Json::Value &request, const Json::Value &reply,
                                         Json::Value &result);
 
+// The same result, return value and messages, for any input, but the
+// sections that the copying form copies ("System"[0], the disk and space
+// records, "iSCSI", "NFS", "time") are moved out of `reply`, which is cheaper
+// in time and memory. What is left of `reply` is unspecified; `reply` and
+// `result` must be distinct values.
+KORVSNMP_EXPORT bool SNMPParseReplyData(const Json::Value &request, Json::Value &&reply,
+                                        Json::Value &result);
+
 #endif

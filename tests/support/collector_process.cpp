@@ -15,7 +15,6 @@
 #include <thread>
 
 #include "protocol/collector_protocol.h"
-#include "protocol/unique_fd.h"
 
 extern char **environ;
 
@@ -24,18 +23,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 constexpr auto kRetry = std::chrono::milliseconds(10);
-
-korvproto::UniqueFd ConnectTo(const std::string &path)
-{
-    korvproto::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_un address;
-    std::memset(&address, 0, sizeof address);
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
-    if (fd.Valid() && connect(fd.Get(), reinterpret_cast<sockaddr *>(&address), sizeof address) == 0)
-        return fd;
-    return korvproto::UniqueFd();
-}
 
 }  // namespace
 
@@ -96,6 +83,18 @@ int CollectorProcess::Stop(int signal)
         return -1;
     kill(pid_, signal);
     return WaitForExit();
+}
+
+korvproto::UniqueFd ConnectTo(const std::string &path)
+{
+    korvproto::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    sockaddr_un address;
+    std::memset(&address, 0, sizeof address);
+    address.sun_family = AF_UNIX;
+    std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
+    if (fd.Valid() && connect(fd.Get(), reinterpret_cast<sockaddr *>(&address), sizeof address) == 0)
+        return fd;
+    return korvproto::UniqueFd();
 }
 
 bool WaitUntilConnectable(const std::string &path)

@@ -9,6 +9,8 @@
 #include <string>
 #include <vector>
 
+#include "protocol/unique_fd.h"
+
 namespace korvtest {
 
 inline constexpr std::chrono::seconds kProcessWait{10};
@@ -36,6 +38,9 @@ private:
     std::string logPath_;
     pid_t pid_ = -1;
 };
+
+// A connection to the UNIX socket `path`; not Valid() when nobody accepts it.
+korvproto::UniqueFd ConnectTo(const std::string &path);
 
 // Whether something accepts connections on `path` within kProcessWait.
 bool WaitUntilConnectable(const std::string &path);

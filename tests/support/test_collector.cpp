@@ -97,7 +97,8 @@ const std::string &PrivateCollectorPath()
 std::vector<std::string> RedirectedChildVariables()
 {
     const char *sanitizer = getenv("ASAN_OPTIONS");
-    std::string asan = sanitizer != nullptr && *sanitizer != '\0' ? std::string(sanitizer) + ":" : "";
+    const std::string asan =
+        sanitizer != nullptr && *sanitizer != '\0' ? std::string(sanitizer) + ":" : "";
     return {std::string("LD_PRELOAD=") + KORVTEST_REDIRECT_LIBRARY,
             std::string(KORVTEST_COLLECTOR_SOCKET_VARIABLE "=") + PrivateCollectorPath(),
             "ASAN_OPTIONS=" + asan + "verify_asan_link_order=0"};

@@ -53,10 +53,10 @@ Json::Value RequestFor(const char *resource)
 
 // SNMPParseReplyData, with the JSON library's errors on values of unexpected
 // types kept in here.
-bool Assemble(const Json::Value &request, Json::Value &reply, Json::Value &result)
+bool Assemble(const Json::Value &request, Json::Value &&reply, Json::Value &result)
 {
     try {
-        return SNMPParseReplyData(request, reply, result);
+        return SNMPParseReplyData(request, std::move(reply), result);
     } catch (const std::bad_alloc &) {
         throw;
     } catch (const std::exception &error) {
@@ -91,7 +91,7 @@ SampleOutcome TakeSample()
         if (time != nullptr)
             part["data"]["time"] = *time;
         Json::Value filled(Json::objectValue);
-        Assemble(RequestFor(section.resource), part, filled);
+        Assemble(RequestFor(section.resource), std::move(part), filled);
         if (filled.isObject() && filled.isMember(section.member))
             outcome.result[section.member].swapPayload(filled[section.member]);
     }

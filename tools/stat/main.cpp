@@ -6,6 +6,7 @@
 #include <chrono>
 #include <iostream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "korvsnmp/korvsnmp.h"
@@ -66,7 +67,7 @@ int Statistics(const korvstat::Options &options)
     if (transmitor.GetDataJson(reply) != 0)
         return Fail("the collector's reply is not JSON");
     Json::Value result(Json::objectValue);
-    if (!SNMPParseReplyData(request, reply, result))
+    if (!SNMPParseReplyData(request, std::move(reply), result))
         return Fail("the collector's reply could not be assembled into statistics");
     Print(result, options);
     return 0;
