@@ -153,7 +153,7 @@ const BadFile kBadFiles[] = {
     {"UnknownContainer", R"({"disks": [{"number": 1, "container": "tray", "device_path": "/dev/sda"}]})",
      "disks[0].container: unknown container \"tray\" (internal, ebox or ssd_cache)"},
     {"PathLongerThanItsField",
-     R"({"disks": [{"number": 1, "container": "internal", "device_path": "/dev/)" + std::string(59, 'x') + "\"}]})",
+     R"({"disks": [{"number": 1, "container": "internal", "device_path": "/dev/)" + std::string(59, 'x') + "\"}]}",
      "disks[0].device_path: longer than 63 characters"},
     {"NameLongerThanItsField", R"({"interfaces": [{"name": "eth0123456789abc"}]})",
      "interfaces[0].name: longer than 15 characters"},
