@@ -187,7 +187,7 @@ TEST_P(BadHostFile, EveryOperationFailsWithOneMessage)
 
     ASSERT_EQ(korvtest::LoggedMessages().size(), 1u);
     const std::string expected = "Host description " + path_ + ": " + GetParam().error;
-    const std::string &message = korvtest::LoggedMessages()[0].text;
+    const std::string message = korvtest::LoggedMessages()[0].text;  // LoggedMessages() returns a copy
     EXPECT_EQ(korvtest::LoggedMessages()[0].priority, LOG_ERR);
     EXPECT_THAT(message, ::testing::StartsWith("korvplatform:"));
     EXPECT_THAT(message, ::testing::HasSubstr(expected)) << message;
