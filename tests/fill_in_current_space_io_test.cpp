@@ -29,56 +29,44 @@
 
 namespace {
 
-using korvstandin::Fault;
-using korvstandin::Op;
-using korvtest::Logged;
-using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
 constexpr char kUnit[] = "fill_in_current_space_io";
 constexpr char kSysBlock[] = "/sys/dev/block";
-constexpr size_t kNodesNeeded = 5;
 
 const auto Parse = korvtest::ParseJson;
 
-class SpaceIOTest : public korvtest::PlatformTest {
-protected:
-    // Runs the fill-in on `spaceIO` over a `space` holding "earlier"; expects
-    // the result `succeeds`.
-    static Json::Value Fill(const Json::Value &spaceIO, bool succeeds = true)
-    {
-        Json::Value space = Parse(R"({"earlier": 1})");
-        EXPECT_EQ(KORVSNMP::FillInCurrentSpaceIO(spaceIO, space), succeeds);
-        return space;
-    }
-};
+// Runs the fill-in on `spaceIO` over a `space` holding "earlier"; expects
+// the result `succeeds`.
+Json::Value Fill(const Json::Value &spaceIO, bool succeeds = true)
+{
+    Json::Value space = Parse(R"({"earlier": 1})");
+    EXPECT_EQ(KORVSNMP::FillInCurrentSpaceIO(spaceIO, space), succeeds);
+    return space;
+}
 
-TEST_F(SpaceIOTest, UnreadableInputFailsAndLeavesTheSectionUntouched)
+using SpaceIOTest = korvtest::PlatformTest;
+
+TEST_F(SpaceIOTest, UnreadableInputFailsUntouchedAndEmptyInputGivesNoVolumes)
 {
     korvstandin::Host().spaces = {{"/dev/none", "vol"}};
-    struct Case {
-        const char *spaceIO;
-        const char *message;
+    const struct {
+        const char *spaceIO, *message;
     } cases[] = {
         {R"({"device": "total"})", "SpaceIO is not array."},
-        {R"("total")", "SpaceIO is not array."},
         {R"([{"device": "total"}, 3])", "SpaceIO element 1 is not an object"},
-        {R"([{"device": "total"}, {"device": 7}])",
-         R"(SpaceIO element 1: "device" is not a string)"},
+        {R"([{"device": "total"}, {"device": 7}])", R"(SpaceIO element 1: "device" is not a string)"},
         {R"([{"device": ["sda"]}])", R"(SpaceIO element 0: "device" is not a string)"},
     };
-    for (const Case &c : cases) {
+    for (const auto &c : cases) {
         SCOPED_TRACE(c.spaceIO);
         korvtest::ClearLog();
         EXPECT_EQ(Fill(Parse(c.spaceIO), false), Parse(R"({"earlier": 1})"));
-        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
+        EXPECT_THAT(korvtest::LoggedMessages(),
+                    ::testing::ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
     }
-}
-
-TEST_F(SpaceIOTest, EmptySectionGivesAnEmptyVolumeList)
-{
+    korvtest::ClearLog();  // an empty section gives an empty volume list
     EXPECT_EQ(Fill(Json::Value(Json::arrayValue)), Parse(R"({"earlier": 1, "volume": []})"));
-    EXPECT_EQ(korvstandin::CallCount(Op::KORVSpaceInfoEnum), 1);
     Json::Value notAnObject = "x";
     EXPECT_TRUE(KORVSNMP::FillInCurrentSpaceIO(Parse(R"([{"device": "total"}])"), notAnObject));
     EXPECT_EQ(notAnObject, Parse(R"({"volume": [], "total": {"device": "total"}})"));
@@ -91,18 +79,17 @@ protected:
     {
         SpaceIOTest::SetUp();
         std::string whyNot;
-        if (!nodes_.Make(kNodesNeeded, whyNot))
+        if (!nodes_.Make(5, whyNot))
             GTEST_SKIP() << whyNot;
         directory_ = nodes_.Directory();
+        std::ofstream(directory_ + "/regular") << "not a device";
     }
-
-    // Path of a node for device `i`, and that device's kernel name.
     const std::string &Node(size_t i) const { return nodes_.Node(i); }
-    const std::string &Name(size_t i) const { return nodes_.Name(i); }
 
+    // The record of device `i`'s kernel name with `members`.
     std::string Record(size_t i, const std::string &members = "") const
     {
-        return R"({"device": ")" + Name(i) + '"' + (members.empty() ? "" : ", " + members) + "}";
+        return R"({"device": ")" + nodes_.Name(i) + '"' + (members.empty() ? "" : ", " + members) + "}";
     }
 
     korvtest::BlockNodes nodes_;
@@ -120,94 +107,54 @@ TEST_F(SpaceIONodeTest, SpaceDevicesAreNamedAndTheLastTotalKept)
     EXPECT_EQ(space, Parse(R"({"earlier": 1, "total": {"device": "total", "n": 2}, "volume": [)" +
                            Record(1, R"("r": 1, "display_name": "Volume 2")") + ", " +
                            Record(0, R"("display_name": "Volume 1")") + ", " +
-                           Record(1, R"("r": 2, "display_name": "Volume 2")") + "]}"))
-        << space.toStyledString();
+                           Record(1, R"("r": 2, "display_name": "Volume 2")") + "]}"));
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
-}
-
-TEST_F(SpaceIONodeTest, NodesThatCannotBeResolvedGetNoName)
-{
-    const std::string file = directory_ + "/regular";
-    std::ofstream(file) << "not a device";
-    const std::string unlinked = directory_ + "/unlinked";
-    ASSERT_EQ(mknod(unlinked.c_str(), S_IFBLK | 0600, makedev(nodes_.Device(0).major, 1048575)), 0);
-    ASSERT_FALSE(std::filesystem::exists(std::string(kSysBlock) + "/" +
-                                         std::to_string(nodes_.Device(0).major) + ":1048575"));
-    korvstandin::Host().spaces = {{directory_ + "/missing", "Missing"},
-                                  {file, "File"},
-                                  {unlinked, "Unlinked"},
-                                  {Node(1), "Volume 2"}};
-    const Json::Value space = Fill(Parse("[" + Record(0) + ", " + Record(1) + "]"));
-    EXPECT_EQ(space["volume"], Parse("[" + Record(1, R"("display_name": "Volume 2")") + "]"))
-        << space.toStyledString();
-}
-
-TEST_F(SpaceIONodeTest, LongDisplayNamesAreCutTo1023Characters)
-{
-    const std::string longName(1500, 'n');
-    korvstandin::Host().spaces = {{Node(0), longName}, {Node(1), "space beneath"}};
-    korvstandin::Host().flashCaches = {{Node(1), "/" + longName + "v", "", false}};
-    korvstandin::Host().flashCaches[0].layerPath = Node(2);
-    const Json::Value space = Fill(Parse("[" + Record(0) + ", " + Record(2) + "]"));
-    ASSERT_EQ(space["volume"].size(), 2u) << space.toStyledString();
-    EXPECT_EQ(space["volume"][0]["display_name"].asString(), longName.substr(0, 1023));
-    EXPECT_EQ(space["volume"][1]["display_name"].asString(), longName.substr(0, 1023));
-}
-
-TEST_F(SpaceIONodeTest, CachedSpaceIsReportedThroughTheCacheDevice)
-{
-    korvstandin::Host().spaces = {{Node(0), "beneath"}, {Node(1), "Volume 2"}};
-    korvstandin::Host().flashCaches = {{Node(0), "//volume1", Node(2), false}};
-    const Json::Value space =
-        Fill(Parse("[" + Record(0) + ", " + Record(1) + ", " + Record(2, R"("r": 5)") + "]"));
-    EXPECT_EQ(space["volume"], Parse("[" + Record(1, R"("display_name": "Volume 2")") + ", " +
-                                     Record(2, R"("r": 5, "display_name": "/volume1")") + "]"))
-        << space.toStyledString();
 }
 
 TEST_F(SpaceIONodeTest, EachCacheSuppressesOneSpaceWithItsPath)
 {
-    korvstandin::Host().spaces = {{Node(0), "first"}, {Node(0), "second"}, {Node(3), "plain"}};
-    korvstandin::Host().flashCaches = {{Node(0), "/cache1", Node(1), false},
-                                       {Node(0), "/cache2", Node(2), false},
+    // Names are cut to 1023 characters.
+    const std::string longName(1500, 'n'), cut = longName.substr(0, 1023);
+    korvstandin::Host().spaces = {{Node(0), "first"}, {Node(0), "second"}, {Node(3), longName}};
+    korvstandin::Host().flashCaches = {{Node(0), "//cache1", Node(1), false},
+                                       {Node(0), "/" + longName + "v", Node(2), false},
                                        {Node(4), "/cache3", Node(3), false}};
-    const Json::Value spaceIO =
-        Parse("[" + Record(0) + ", " + Record(1) + ", " + Record(2) + ", " + Record(3) + "]");
-    // A space on a cache's layered device replaces the cache's name.
-    const std::string cachesAndPlain = Record(1, R"("display_name": "cache1")") + ", " +
-                                       Record(2, R"("display_name": "cache2")") + ", " +
-                                       Record(3, R"("display_name": "plain")");
+    const Json::Value spaceIO = Parse("[" + Record(0) + ", " + Record(1) + ", " + Record(2) + ", " + Record(3) + "]");
+    // A cached space is reported under the cache's layered device, named by
+    // the cache's path without its first '/'.
+    const std::string cachesAndPlain = Record(1, R"("display_name": "/cache1")") + ", " +
+                                       Record(2, R"("display_name": ")" + cut + '"') + ", " +
+                                       Record(3, R"("display_name": ")" + cut + '"');
     Json::Value space = Fill(spaceIO);
-    EXPECT_EQ(space["volume"], Parse("[" + cachesAndPlain + "]")) << space.toStyledString();
+    EXPECT_EQ(space["volume"], Parse("[" + cachesAndPlain + "]"));
 
     // A third space with the cached path is beyond what the two caches take.
     korvstandin::Host().spaces.insert(korvstandin::Host().spaces.begin() + 2, {Node(0), "third"});
     space = Fill(spaceIO);
-    EXPECT_EQ(space["volume"],
-              Parse("[" + Record(0, R"("display_name": "third")") + ", " + cachesAndPlain + "]"))
-        << space.toStyledString();
+    EXPECT_EQ(space["volume"], Parse("[" + Record(0, R"("display_name": "third")") + ", " + cachesAndPlain + "]"));
 }
 
-TEST_F(SpaceIONodeTest, UnresolvedCachesLeaveTheirSpacesNamed)
+// A node that is missing, not a device or has no /sys/dev/block link names
+// nothing; a cache whose layered device is so leaves its space named.
+TEST_F(SpaceIONodeTest, UnresolvedNodesAndCaches)
 {
-    const std::string file = directory_ + "/regular";
-    std::ofstream(file) << "not a device";
-    korvstandin::Host().spaces = {{Node(0), "zero"}, {Node(1), "one"}, {Node(2), "two"}};
+    const std::string unlinked = directory_ + "/unlinked";
+    ASSERT_EQ(mknod(unlinked.c_str(), S_IFBLK | 0600, makedev(nodes_.Device(0).major, 1048575)), 0);
+    korvstandin::Host().spaces = {{directory_ + "/missing", "Missing"}, {directory_ + "/regular", "File"},
+                                  {unlinked, "Unlinked"}, {Node(0), "zero"}, {Node(1), "one"}, {Node(2), "two"}};
     korvstandin::Host().flashCaches = {{Node(0), "/c0", Node(3), true},
-                                       {Node(1), "/c1", file, false},
-                                       {Node(2), "/c2", directory_ + "/missing", false}};
-    const std::string spaceIO =
-        "[" + Record(0) + ", " + Record(1) + ", " + Record(2) + ", " + Record(3) + "]";
-    const Json::Value expected =
-        Parse("[" + Record(0, R"("display_name": "zero")") + ", " +
-              Record(1, R"("display_name": "one")") + ", " + Record(2, R"("display_name": "two")") +
-              "]");
+                                       {Node(1), "/c1", directory_ + "/regular", false},
+                                       {Node(2), "/c2", unlinked, false}};
+    const std::string spaceIO = "[" + Record(0) + ", " + Record(1) + ", " + Record(2) + ", " + Record(3) + "]";
+    const Json::Value expected = Parse("[" + Record(0, R"("display_name": "zero")") + ", " +
+                                       Record(1, R"("display_name": "one")") + ", " +
+                                       Record(2, R"("display_name": "two")") + "]");
     EXPECT_EQ(Fill(Parse(spaceIO))["volume"], expected);
 
     // Without the cache list, no cache is named either way.
     korvstandin::Host().flashCaches = {{Node(0), "/c0", Node(3), false}};
-    for (Fault fault : {Fault::Fail, Fault::FailLeavingList}) {
-        korvstandin::SetFault(Op::KORVFlashCacheConfigGet, fault);
+    for (korvstandin::Fault fault : {korvstandin::Fault::Fail, korvstandin::Fault::FailLeavingList}) {
+        korvstandin::SetFault(korvstandin::Op::KORVFlashCacheConfigGet, fault);
         EXPECT_EQ(Fill(Parse(spaceIO))["volume"], expected);
     }
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
@@ -219,28 +166,21 @@ TEST_F(SpaceIONodeTest, UnresolvedCachesLeaveTheirSpacesNamed)
 TEST_F(SpaceIONodeTest, OverlongLinkTargetIsCutAndTerminated)
 {
     constexpr int kRefused = 77;
-    const std::string target =
-        "../" + std::string(1000, 'd') + "/abcdefghijklmnopqrstuvwxyz0123456789";
-    const std::string kept = target.substr(0, 1023);
-    const std::string key = kept.substr(kept.rfind('/') + 1);
+    const std::string target = "../" + std::string(1000, 'd') + "/abcdefghijklmnopqrstuvwxyz0123456789";
+    const std::string key = target.substr(0, 1023).substr(1004);
     korvstandin::Host().spaces = {{Node(0), "long link"}};
-    const Json::Value spaceIO = Parse(R"([{"device": ")" + key + R"("}])");
     const std::string link = std::string(kSysBlock) + "/" + std::to_string(nodes_.Device(0).major) +
                              ":" + std::to_string(nodes_.Device(0).minor);
 
     pid_t child = fork();
     ASSERT_NE(child, -1) << std::strerror(errno);
     if (child == 0) {
-        if (unshare(CLONE_NEWNS) != 0 ||
-            mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
-            mount("tmpfs", kSysBlock, "tmpfs", 0, nullptr) != 0 ||
-            symlink(target.c_str(), link.c_str()) != 0)
+        if (unshare(CLONE_NEWNS) != 0 || mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+            mount("tmpfs", kSysBlock, "tmpfs", 0, nullptr) != 0 || symlink(target.c_str(), link.c_str()) != 0)
             _exit(kRefused);
         Json::Value space;
-        bool named = KORVSNMP::FillInCurrentSpaceIO(spaceIO, space) &&
-                     space["volume"].size() == 1 &&
-                     space["volume"][0]["display_name"] == "long link";
-        _exit(named ? 0 : 1);
+        _exit(KORVSNMP::FillInCurrentSpaceIO(Parse(R"([{"device": ")" + key + R"("}])"), space) && space["volume"].size() == 1 &&
+                      space["volume"][0]["display_name"] == "long link" ? 0 : 1);
     }
     int status = 0;
     ASSERT_EQ(waitpid(child, &status, 0), child);

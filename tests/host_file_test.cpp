@@ -22,29 +22,12 @@
 
 namespace {
 
-using korvtest::Logged;
-using ::testing::ElementsAre;
 
 // A host file in a temporary directory, named to the stand-in through the
 // environment for the test's lifetime.
 class HostFileTest : public korvtest::PlatformTest {
 protected:
-    void SetUp() override
-    {
-        PlatformTest::SetUp();
-        char pattern[] = "/tmp/korvsnmp-host-XXXXXX";
-        ASSERT_NE(mkdtemp(pattern), nullptr);
-        directory_ = pattern;
-        path_ = directory_ + "/host.json";
-    }
-    void TearDown() override
-    {
-        unsetenv(korvstandin::kHostFileVariable);
-        std::remove(path_.c_str());
-        rmdir(directory_.c_str());
-        PlatformTest::TearDown();
-        korvstandin::Reset();
-    }
+    ~HostFileTest() override { unsetenv(korvstandin::kHostFileVariable); std::remove(path_.c_str()); korvstandin::Reset(); }
 
     // Writes `text` as the host file and lets the next platform call read it.
     void UseHostFile(const std::string &text)
@@ -55,9 +38,15 @@ protected:
         korvtest::ClearLog();
     }
 
-    std::string directory_;
-    std::string path_;
+    const std::string path_ = "/tmp/korvsnmp-host-" + std::to_string(getpid()) + ".json";
 };
+
+std::string FileText(const char *path)
+{
+    std::stringstream text;
+    text << std::ifstream(path).rdbuf();
+    return text.str();
+}
 
 TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
 {
@@ -71,12 +60,17 @@ TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
         devices.push_back({nodes.Node(i), nodes.Name(i)});
     const korvexample::Appliance appliance = korvexample::MakeAppliance(shape, devices);
     const Json::Value request(Json::objectValue);
-
     korvstandin::Host() = appliance.host;
     Json::Value inMemory;
     ASSERT_TRUE(SNMPParseReplyData(request, appliance.reply, inMemory));
 
-    UseHostFile(korvstandin::HostFileText(appliance.host));
+    const std::string text = korvstandin::HostFileText(appliance.host);
+    korvstandin::HostDescription read;
+    std::string error;
+    ASSERT_TRUE(korvstandin::ParseHostDescription(text, read, error)) << error;
+    EXPECT_EQ(korvstandin::HostFileText(read), text);  // written and read back the same
+
+    UseHostFile(text);
     Json::Value fromFile;
     ASSERT_TRUE(SNMPParseReplyData(request, appliance.reply, fromFile));
 
@@ -85,28 +79,10 @@ TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
     EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
 }
 
-TEST_F(HostFileTest, WrittenDescriptionReadsBackTheSame)
-{
-    const korvexample::ApplianceShape shape = korvexample::LargeAppliance();
-    const korvexample::Appliance appliance =
-        korvexample::MakeAppliance(shape, korvexample::ApplianceSpaceDevices(shape.spaces));
-    const std::string text = korvstandin::HostFileText(appliance.host);
-    korvstandin::HostDescription read;
-    std::string error;
-    ASSERT_TRUE(korvstandin::ParseHostDescription(text, read, error)) << error;
-    EXPECT_EQ(korvstandin::HostFileText(read), text);
-}
-
 TEST_F(HostFileTest, LargeApplianceExampleFilesMatch)
 {
-    std::ifstream replyFile(KORVSNMP_EXAMPLES_DIR "/large-appliance.reply.json");
-    std::stringstream replyText;
-    replyText << replyFile.rdbuf();
-    const Json::Value reply = korvtest::ParseJson(replyText.str());
-    std::ifstream hostFile(KORVSNMP_EXAMPLES_DIR "/large-appliance.host.json");
-    std::stringstream hostText;
-    hostText << hostFile.rdbuf();
-    UseHostFile(hostText.str());
+    const Json::Value reply = korvtest::ParseJson(FileText(KORVSNMP_EXAMPLES_DIR "/large-appliance.reply.json"));
+    UseHostFile(FileText(KORVSNMP_EXAMPLES_DIR "/large-appliance.host.json"));
 
     Json::Value result;
     ASSERT_TRUE(SNMPParseReplyData(Json::Value(Json::objectValue), reply, result));
@@ -120,25 +96,20 @@ struct BadFile {
     const char *name;
     std::string text;
     const char *error;  // what the message says after the file's path
+    bool absent = false;  // the file is gone before it is read
 };
 
-std::string Interfaces(int count)
+// `count` copies of `element`, separated by commas.
+std::string Repeated(const std::string &element, int count)
 {
-    std::string text = R"({"interfaces": [)";
-    for (int i = 0; i < count; ++i)
-        text += (i ? "," : "") + std::string(R"({"name": "eth)") + std::to_string(i) + "\"}";
-    return text + "]}";
-}
-
-std::string Members(int count)
-{
-    std::string list;
-    for (int i = 0; i < count; ++i)
-        list += (i ? ",\"e" : "\"e") + std::to_string(i) + "\"";
+    std::string list = element;
+    for (int i = 1; i < count; ++i)
+        list += "," + element;
     return list;
 }
 
 const BadFile kBadFiles[] = {
+    {"Absent", "", "cannot be opened", true},
     {"NotJson", "{\"disks\": [", "not JSON: * Line 1, Column 12"},
     {"TrailingGarbage", "{} {}", "not JSON: * Line 1, Column 4"},
     {"NotAnObject", "[]", "top level: not an object"},
@@ -150,66 +121,49 @@ const BadFile kBadFiles[] = {
     {"MissingMember", R"({"spaces": [{"name": "volume1"}]})", "spaces[0]: member \"device_path\" missing"},
     {"UnknownRole", R"({"interfaces": [{"name": "br0", "role": "bridge"}]})",
      "interfaces[0].role: unknown role \"bridge\" (plain, vlan, aggregation or ovs_master)"},
-    {"UnknownContainer", R"({"disks": [{"number": 1, "container": "tray", "device_path": "/dev/sda"}]})",
-     "disks[0].container: unknown container \"tray\" (internal, ebox or ssd_cache)"},
     {"PathLongerThanItsField",
      R"({"disks": [{"number": 1, "container": "internal", "device_path": "/dev/)" + std::string(59, 'x') + "\"}]}",
      "disks[0].device_path: longer than 63 characters"},
     {"NameLongerThanItsField", R"({"interfaces": [{"name": "eth0123456789abc"}]})",
      "interfaces[0].name: longer than 15 characters"},
     {"TooManyMembers", R"({"interfaces": [{"name": "bond0", "role": "aggregation", "members": [)" +
-                           Members(33) + "]}]}",
+                           Repeated(R"("eth0")", 33) + "]}]}",
      "interfaces[0].members: 33 elements, more than 32"},
-    {"TenThousandInterfaces", Interfaces(10000), "interfaces: 10000 elements, more than 256"},
+    {"TenThousandInterfaces", R"({"interfaces": [)" + Repeated(R"({"name": "eth0"})", 10000) + "]}",
+     "interfaces: 10000 elements, more than 256"},
     {"DeeplyNested", std::string(100000, '[') + std::string(100000, ']'), "not JSON: "},
 };
 
-class BadHostFile : public HostFileTest, public ::testing::WithParamInterface<BadFile> {};
-
-TEST_P(BadHostFile, EveryOperationFailsWithOneMessage)
+TEST_F(HostFileTest, BadFileFailsEveryOperationWithOneMessage)
 {
-    UseHostFile(GetParam().text);
+    for (const BadFile &bad : kBadFiles) {
+        SCOPED_TRACE(bad.name);
+        UseHostFile(bad.text);
+        if (bad.absent)
+            std::remove(path_.c_str());
 
-    KLIBNetInterfaceInfo records[4] = {};
-    EXPECT_EQ(KLIBNetGetInterfaceInfo(records, 4, 6), -1);
-    DiskFilter filter{DISK_CONTAINER_INTERNAL};
-    DiskInfoList *disks = nullptr;
-    EXPECT_EQ(DiskInfoEnum(&filter, &disks), -1);
-    EXPECT_EQ(disks, nullptr);
-    EXPECT_EQ(KLIBSystemPhysMemSizeGet(), 0u);
-    char text[64] = {};
-    EXPECT_EQ(KLIBCFileGetSectionValue(korvstandin::kStringsFilePath, "volume", "volume_disk", text,
-                                       sizeof text),
-              -1);
-    Json::Value response;
-    EXPECT_LT(KORV::APIRunner::Exec(response, "KORV.Core.ISCSI.LUN", 1, "list", Json::Value(), "admin"), 0);
-    EXPECT_FALSE(response["success"].asBool());
+        KLIBNetInterfaceInfo records[4] = {};
+        EXPECT_EQ(KLIBNetGetInterfaceInfo(records, 4, 6), -1);
+        DiskFilter filter{DISK_CONTAINER_INTERNAL};
+        DiskInfoList *disks = nullptr;
+        EXPECT_EQ(DiskInfoEnum(&filter, &disks), -1);
+        EXPECT_EQ(KLIBSystemPhysMemSizeGet(), 0u);
+        char text[64] = {};
+        EXPECT_EQ(KLIBCFileGetSectionValue(korvstandin::kStringsFilePath, "volume", "volume_disk", text, 64), -1);
+        Json::Value response;
+        EXPECT_LT(KORV::APIRunner::Exec(response, "KORV.Core.ISCSI.LUN", 1, "list", Json::Value(), "admin"), 0);
+        EXPECT_FALSE(response["success"].asBool());
+        EXPECT_EQ(KORVPPPoeIntfGet(nullptr, 0), -1);
+        EXPECT_EQ(SupportEBox(), 0);
 
-    const std::vector<korvtest::LogEntry> logged = korvtest::LoggedMessages();
-    ASSERT_EQ(logged.size(), 1u);
-    const std::string expected = "Host description " + path_ + ": " + GetParam().error;
-    const std::string &message = logged[0].text;
-    EXPECT_EQ(logged[0].priority, LOG_ERR);
-    EXPECT_THAT(message, ::testing::StartsWith("korvplatform:"));
-    EXPECT_THAT(message, ::testing::HasSubstr(expected)) << message;
-    EXPECT_THAT(message, ::testing::EndsWith("; every platform operation fails"));
-}
-
-INSTANTIATE_TEST_SUITE_P(Files, BadHostFile, ::testing::ValuesIn(kBadFiles),
-                         [](const auto &info) { return std::string(info.param.name); });
-
-TEST_F(HostFileTest, UnreadableFileFailsEveryOperation)
-{
-    setenv(korvstandin::kHostFileVariable, (directory_ + "/absent.json").c_str(), 1);
-    korvstandin::UseProcessHost();
-    korvtest::ClearLog();
-
-    EXPECT_EQ(KORVPPPoeIntfGet(nullptr, 0), -1);
-    EXPECT_EQ(SupportEBox(), 0);
-    EXPECT_THAT(korvtest::LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, "korvplatform",
-                                   "Host description " + directory_ +
-                                       "/absent.json: cannot be opened; every platform operation fails")));
+        const std::vector<korvtest::LogEntry> logged = korvtest::LoggedMessages();
+        ASSERT_EQ(logged.size(), 1u);
+        EXPECT_EQ(logged[0].priority, LOG_ERR);
+        EXPECT_THAT(logged[0].text,
+                    ::testing::AllOf(::testing::StartsWith("korvplatform:"),
+                                     ::testing::HasSubstr("Host description " + path_ + ": " + bad.error),
+                                     ::testing::EndsWith("; every platform operation fails")));
+    }
 }
 
 }  // namespace

@@ -10,61 +10,44 @@
 
 #include "json_text.h"
 #include "korv_standin.h"
-#include "platform_test.h"
 #include "korvsnmp/parse_data.h"
+#include "platform_test.h"
 #include "syslog_capture.h"
 
 namespace {
 
-using korvtest::Logged;
 using korvtest::LoggedMessages;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
-
-const char kUnit[] = "parse_data";
+using Members = std::set<std::string>;
 
 const auto Parse = korvtest::ParseJson;
 
-// A reply with every section, small enough that each fill-in succeeds.
+// A reply with every section, small enough that each fill-in succeeds on
+// the host that this describes (one interface, eth0).
 Json::Value FullReply()
 {
-    return Parse(R"({"data": {
-        "System": [{"user": 3, "idle": 90}],
-        "Memory": [{"total_real": 2048}],
-        "Network": [{"device": "eth0", "rx": 1, "tx": 2}],
-        "DiskIO": [],
-        "SpaceIO": [],
-        "iSCSI": [],
-        "NFS": {"read": 7},
-        "time": 1700000000}})");
+    korvstandin::Host().interfaces = {{"eth0"}};
+    return Parse(R"({"data": {"System": [{"user": 3, "idle": 90}], "Memory": [{"total_real": 2048}],
+        "Network": [{"device": "eth0", "rx": 1, "tx": 2}], "DiskIO": [], "SpaceIO": [], "iSCSI": [],
+        "NFS": {"read": 7}, "time": 1700000000}})");
 }
 
-std::set<std::string> Members(const Json::Value &result)
+Members MembersOf(const Json::Value &result)
 {
-    std::set<std::string> names;
-    for (const std::string &name : result.getMemberNames())
-        names.insert(name);
-    return names;
+    const std::vector<std::string> names = result.getMemberNames();
+    return {names.begin(), names.end()};
 }
 
-const std::set<std::string> kEverySection = {"cpu", "disk", "lun", "memory", "network",
-                                             "nfs", "space", "time"};
+const Members kEverySection = {"cpu", "disk", "lun", "memory", "network", "nfs", "space", "time"};
 
-class ParseDataTest : public korvtest::PlatformTest {
-protected:
-    void SetUp() override
-    {
-        PlatformTest::SetUp();
-        korvstandin::Host().interfaces = {{"eth0"}};
-    }
-};
+using ParseDataTest = korvtest::PlatformTest;
 
 TEST_F(ParseDataTest, EverySectionIsTakenOverWithTime)
 {
     Json::Value result;
     ASSERT_TRUE(SNMPParseReplyData(Json::Value(Json::objectValue), FullReply(), result));
-
-    EXPECT_EQ(Members(result), kEverySection);
+    EXPECT_EQ(MembersOf(result), kEverySection);
     EXPECT_EQ(result["cpu"], Parse(R"({"user": 3, "idle": 90})"));
     EXPECT_EQ(result["memory"]["memory_size"].asUInt(), 2048u);
     EXPECT_EQ(korvtest::JsonText(result["network"][0]),
@@ -77,107 +60,74 @@ TEST_F(ParseDataTest, EverySectionIsTakenOverWithTime)
     EXPECT_THAT(LoggedMessages(), IsEmpty());
 }
 
-struct SelectionCase {
-    const char *name;
-    const char *request;
-    const char *dropped;  // a section the reply lacks, or ""
-    std::set<std::string> members;
-};
-
-class ParseDataSelectionTest : public ParseDataTest,
-                               public ::testing::WithParamInterface<SelectionCase> {};
-
-TEST_P(ParseDataSelectionTest, RequestSelectsTheSections)
+TEST_F(ParseDataTest, RequestSelectsTheSections)
 {
-    Json::Value reply = FullReply();
-    reply["data"].removeMember(GetParam().dropped);
-    Json::Value result;
-
-    EXPECT_TRUE(SNMPParseReplyData(Parse(GetParam().request), reply, result));
-
-    EXPECT_EQ(Members(result), GetParam().members);
+    const struct {
+        const char *request;
+        const char *dropped;  // a section the reply lacks, or ""
+        Members members;
+    } cases[] = {
+        {"{}", "", kEverySection},
+        {"null", "", kEverySection},
+        {R"({"resource": []})", "", kEverySection},
+        {R"({"resource": ["disk", "all"]})", "", kEverySection},
+        {R"({"resource": ["memory"]})", "System", {"memory", "time"}},  // memory needs no cpu
+        {R"({"resource": ["nfs", "cpu"]})", "", {"cpu", "nfs", "time"}},
+        {R"({"resource": ["bogus"]})", "", {"time"}},
+        {R"({"resource": "cpu"})", "", kEverySection},
+        {R"({"resource": {"a": "cpu"}})", "", {"time"}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.request);
+        Json::Value reply = FullReply(), result;
+        reply["data"].removeMember(c.dropped);
+        EXPECT_TRUE(SNMPParseReplyData(Parse(c.request), reply, result));
+        EXPECT_EQ(MembersOf(result), c.members);
+    }
     EXPECT_THAT(LoggedMessages(), IsEmpty());
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Resources, ParseDataSelectionTest,
-    ::testing::Values(
-        SelectionCase{"NoList", "{}", "", kEverySection},
-        SelectionCase{"NullRequest", "null", "", kEverySection},
-        SelectionCase{"EmptyList", R"({"resource": []})", "", kEverySection},
-        SelectionCase{"All", R"({"resource": ["disk", "all"]})", "", kEverySection},
-        SelectionCase{"MemoryOnlyNeedsNoCpu", R"({"resource": ["memory"]})", "System",
-                      {"memory", "time"}},
-        SelectionCase{"TwoInAnyOrder", R"({"resource": ["nfs", "cpu"]})", "", {"cpu", "nfs", "time"}},
-        SelectionCase{"UnknownName", R"({"resource": ["bogus"]})", "", {"time"}},
-        SelectionCase{"ListIsAString", R"({"resource": "cpu"})", "", kEverySection},
-        SelectionCase{"ListIsAnObject", R"({"resource": {"a": "cpu"}})", "", {"time"}}),
-    [](const auto &info) { return std::string(info.param.name); });
-
-struct FailureCase {
-    const char *name;
-    const char *request;
-    const char *member;    // the reply's data member to replace (or drop)
-    const char *value;     // its new value; "" drops it
-    const char *message;   // "" when the section's fill-in function fails silently
-    std::set<std::string> members;
-};
-
-class ParseDataFailureTest : public ParseDataTest,
-                             public ::testing::WithParamInterface<FailureCase> {};
-
-TEST_P(ParseDataFailureTest, FirstBadSectionEndsTheAssembly)
+// The result is never cleared; a fill-in's member is created, null, before
+// the call that fails.
+TEST_F(ParseDataTest, FirstBadSectionEndsTheAssembly)
 {
-    Json::Value reply = FullReply();
-    if (*GetParam().value == '\0')
-        reply["data"].removeMember(GetParam().member);
-    else
-        reply["data"][GetParam().member] = Parse(GetParam().value);
-    Json::Value result(Json::objectValue);
-    result["kept"] = true;
-
-    EXPECT_FALSE(SNMPParseReplyData(Parse(GetParam().request), reply, result));
-
-    std::set<std::string> expected = GetParam().members;
-    expected.insert("kept");  // the result is never cleared
-    EXPECT_EQ(Members(result), expected);
-    if (*GetParam().message == '\0')
-        EXPECT_THAT(LoggedMessages(), IsEmpty());
-    else
-        EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, GetParam().message)));
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Sections, ParseDataFailureTest,
-    ::testing::Values(
-        FailureCase{"NfsMissing", "{}", "NFS", "", "Failed to get NFS data",
-                    {"cpu", "memory", "network", "disk", "space", "lun"}},
-        FailureCase{"NfsMissingAskedBeforeCpu", R"({"resource": ["nfs", "cpu"]})", "NFS", "",
-                    "Failed to get NFS data", {"cpu"}},
-        FailureCase{"TwoCpuRecords", "{}", "System", "[{}, {}]", "Failed to get CPU data", {}},
-        FailureCase{"NoMemoryRecord", "{}", "Memory", "[]", "Failed to get Memory data", {"cpu"}},
-        FailureCase{"EmptyNetwork", "{}", "Network", "[]", "Failed to get Network data",
-                    {"cpu", "memory"}},
-        FailureCase{"NetworkObject", "{}", "Network", R"({"device": "eth0"})",
-                    "Failed to get Network data", {"cpu", "memory"}},
-        // The fill-in's member is created, null, before the call that fails.
-        FailureCase{"DiskIONotAnArray", "{}", "DiskIO", "\"x\"", "", {"cpu", "memory", "network", "disk"}},
-        FailureCase{"SpaceIOMissing", "{}", "SpaceIO", "", "Failed to get SpaceIO data",
-                    {"cpu", "memory", "network", "disk"}},
-        FailureCase{"ISCSIMissing", R"({"resource": ["lun"]})", "iSCSI", "",
-                    "Failed to get ISCSI data", {}},
-        FailureCase{"NoTime", "{}", "time", "", "Failed to get time data",
-                    {"cpu", "memory", "network", "disk", "space", "lun", "nfs"}},
-        FailureCase{"NoTimeNothingAsked", R"({"resource": ["bogus"]})", "time", "",
-                    "Failed to get time data", {}}),
-    [](const auto &info) { return std::string(info.param.name); });
-
-TEST_F(ParseDataTest, ReplyWithoutDataFailsAtTheFirstSelectedSection)
-{
-    Json::Value result;
-    EXPECT_FALSE(SNMPParseReplyData(Parse(R"({"resource": ["disk", "space"]})"),
-                                    Parse(R"({"error": 1})"), result));
-    EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, "Failed to get DiskIO data")));
+    const struct {
+        const char *request;
+        const char *member;   // the reply's data member to replace (or drop)
+        const char *value;    // its new value; "" drops it
+        const char *message;  // "" when the section's fill-in fails silently
+        Members members;
+    } cases[] = {
+        {"{}", "NFS", "", "Failed to get NFS data", {"cpu", "memory", "network", "disk", "space", "lun"}},
+        {R"({"resource": ["nfs", "cpu"]})", "NFS", "", "Failed to get NFS data", {"cpu"}},
+        {"{}", "System", "[{}, {}]", "Failed to get CPU data", {}},
+        {"{}", "Memory", "[]", "Failed to get Memory data", {"cpu"}},
+        {"{}", "Network", "[]", "Failed to get Network data", {"cpu", "memory"}},
+        {"{}", "Network", R"({"device": "eth0"})", "Failed to get Network data", {"cpu", "memory"}},
+        {"{}", "DiskIO", "\"x\"", "", {"cpu", "memory", "network", "disk"}},
+        {"{}", "SpaceIO", "", "Failed to get SpaceIO data", {"cpu", "memory", "network", "disk"}},
+        {R"({"resource": ["lun"]})", "iSCSI", "", "Failed to get ISCSI data", {}},
+        {"{}", "time", "", "Failed to get time data", {"cpu", "memory", "network", "disk", "space", "lun", "nfs"}},
+        {R"({"resource": ["bogus"]})", "time", "", "Failed to get time data", {}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(std::string(c.member) + " " + c.value + " asked by " + c.request);
+        korvtest::ClearLog();
+        Json::Value reply = FullReply();
+        if (*c.value == '\0')
+            reply["data"].removeMember(c.member);
+        else
+            reply["data"][c.member] = Parse(c.value);
+        Json::Value result = Parse(R"({"kept": true})");
+        EXPECT_FALSE(SNMPParseReplyData(Parse(c.request), reply, result));
+        Members expected = c.members;
+        expected.insert("kept");
+        EXPECT_EQ(MembersOf(result), expected);
+        if (*c.message == '\0')
+            EXPECT_THAT(LoggedMessages(), IsEmpty());
+        else
+            EXPECT_THAT(LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, "parse_data", c.message)));
+    }
 }
 
 TEST_F(ParseDataTest, ValuesOfTheWrongTypeFailWithAMessage)
@@ -185,19 +135,24 @@ TEST_F(ParseDataTest, ValuesOfTheWrongTypeFailWithAMessage)
     const Json::Value array(Json::arrayValue);
     Json::Value dataArray = FullReply();
     dataArray["data"] = array;
-    struct {
+    const struct {
         Json::Value request, reply, result;
+        const char *message;
     } cases[] = {
-        {array, FullReply(), Json::Value()},
-        {Json::Value(), Json::Value("reply"), Json::Value()},
-        {Json::Value(), dataArray, Json::Value()},
-        {Json::Value(), FullReply(), Json::Value(7)},
+        {array, FullReply(), Json::Value(), "Request, reply and result must be JSON objects (types 6, 7, 0)"},
+        {Json::Value(), Json::Value("reply"), Json::Value(),
+         "Request, reply and result must be JSON objects (types 0, 4, 0)"},
+        {Json::Value(), dataArray, Json::Value(), "Reply data is not a JSON object (type 6)"},
+        {Json::Value(), FullReply(), Json::Value(7),
+         "Request, reply and result must be JSON objects (types 0, 7, 1)"},
+        {Parse(R"({"resource": ["disk", "space"]})"), Parse(R"({"error": 1})"), Json::Value(),
+         "Failed to get DiskIO data"},
     };
-    for (auto &bad : cases) {
+    for (const auto &bad : cases) {
         korvtest::ClearLog();
-        EXPECT_FALSE(SNMPParseReplyData(bad.request, bad.reply, bad.result));
-        ASSERT_EQ(LoggedMessages().size(), 1u);
-        EXPECT_EQ(LoggedMessages()[0].priority, LOG_ERR);
+        Json::Value result = bad.result;
+        EXPECT_FALSE(SNMPParseReplyData(bad.request, bad.reply, result));
+        EXPECT_THAT(LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, "parse_data", bad.message)));
     }
 }
 
