@@ -5,6 +5,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <json/writer.h>  // prints a Json::Value in a failure
 
 #include "json_text.h"
 #include "korv_standin.h"

@@ -19,6 +19,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <json/writer.h>  // prints a Json::Value in a failure
 
 #include "block_nodes.h"
 #include "json_text.h"
