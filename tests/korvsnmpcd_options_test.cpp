@@ -170,6 +170,8 @@ TEST(KorvsnmpcdProgram, DaemonKeepsNoneOfItsCallersDescriptors)
     while (Running(daemon) && Clock::now() < giveUp)
         std::this_thread::sleep_for(std::chrono::milliseconds(10));
     EXPECT_FALSE(Running(daemon));
+    if (Running(daemon))
+        kill(daemon, SIGKILL);  // leave nothing behind when SIGTERM did not stop it
     EXPECT_NE(access(socket.c_str(), F_OK), 0);
 }
 
