@@ -144,7 +144,7 @@ std::string Camel(const std::string &member)
     return name;
 }
 
-// What a walk with -Os -OQ -Oe -OU must show for the library's result of the
+// The objects (values without their types) that a walk must show for the library's result of the
 // first sample (rows numbered from 1 in the result's order), the subagent's
 // own age and failure count left out.
 std::map<std::string, std::string> ExpectedObjects(const Json::Value &result)
@@ -243,10 +243,12 @@ protected:
         ASSERT_TRUE(WaitForSample(time)) << subagent_->Log();
     }
 
+    // A walk shows each value's type ("Gauge32: 5"), so that a wrong one shows; a get does not.
     std::string Client(const std::string &tool, const std::string &arguments) const
     {
         return RunCommand("SNMP_PERSISTENT_DIR=" + nodes_.Directory() + "/client " + tool +
-                          " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB -Os -OQ -Oe -OU 127.0.0.1:" +
+                          " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB -Os -Oe -OU " +
+                          (tool.find("walk") == std::string::npos ? "-OQ " : "") + "127.0.0.1:" +
                           std::to_string(port_) + " " + arguments);
     }
 
@@ -279,7 +281,8 @@ protected:
         return result;
     }
 
-    // A walk's objects, the walk's end and the subagent's own age and failure count left out.
+    // A walk's objects without their types ("Wrong Type (should be Gauge32): Counter32: 5" keeps
+    // one), the walk's end and the subagent's own age and failure count left out.
     static std::map<std::string, std::string> Objects(const std::string &walk)
     {
         std::map<std::string, std::string> objects;
@@ -290,7 +293,7 @@ protected:
                 objects["?" + line] = "";
             else if (line.find(" = No more variables", equals) != equals && line.rfind("korvSnapshotAge", 0) != 0 &&
                      line.rfind("korvFailedSamples", 0) != 0)
-                objects[line.substr(0, equals)] = line.substr(equals + 3);
+                objects[line.substr(0, equals)] = line.substr(line.find(": ", equals) + 2);
         }
         return objects;
     }
