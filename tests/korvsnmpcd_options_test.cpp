@@ -7,6 +7,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <climits>
 #include <fstream>
 #include <string>
@@ -65,7 +66,11 @@ TEST(KorvsnmpcdProgram, ExitStatusAndOutputOfTheCommandLine)
         {{"--probe", "--socket", "/nonexistent/k.sock"}, 1, Eq("")},  // nothing listens there
     };
     for (const auto &c : cases) {
-        CollectorProcess program(KORVSNMPCD_PATH, c.args, TestPath("cli.log"));
+        // A bad argument wrongly accepted must not start a daemon on the fixed path.
+        std::vector<std::string> args = c.args;
+        if (std::none_of(args.begin(), args.end(), [](const std::string &a) { return a.rfind("--socket", 0) == 0; }))
+            args.insert(args.begin(), {"--socket", TestPath("cli.sock")});
+        CollectorProcess program(KORVSNMPCD_PATH, args, TestPath("cli.log"));
         EXPECT_EQ(program.WaitForExit(), c.status) << c.args[0];
         EXPECT_THAT(program.Log(), c.output) << c.args[0];
     }
