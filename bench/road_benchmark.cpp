@@ -305,8 +305,26 @@ extern "C" ssize_t readlink(const char *__restrict path, char *__restrict buffer
         return Timed(kSocketCall, [&] { return next args; });                           \
     }
 KORVBENCH_SOCKET_CALL(int, socket, (int domain, int type, int protocol), (domain, type, protocol))
-KORVBENCH_SOCKET_CALL(int, connect, (int fd, const sockaddr *address, socklen_t length),
-                      (fd, address, length))
+
+// The benchmark's collector listens on a private path (gPrivateSocketPath);
+// connect() to the collector's fixed path goes there, so that a collector
+// running on this host is left alone.
+static std::string gPrivateSocketPath;
+
+extern "C" int connect(int fd, const sockaddr *address, socklen_t length) noexcept
+{
+    static const auto next = Next<int (*)(int, const sockaddr *, socklen_t)>("connect");
+    sockaddr_un redirected{};
+    const auto *named = reinterpret_cast<const sockaddr_un *>(address);
+    if (!gPrivateSocketPath.empty() && address != nullptr && address->sa_family == AF_UNIX &&
+        std::strcmp(named->sun_path, korvproto::kCollectorSocketPath) == 0) {
+        redirected.sun_family = AF_UNIX;
+        std::strcpy(redirected.sun_path, gPrivateSocketPath.c_str());
+        address = reinterpret_cast<const sockaddr *>(&redirected);
+        length = sizeof redirected;
+    }
+    return Timed(kSocketCall, [&] { return next(fd, address, length); });
+}
 KORVBENCH_SOCKET_CALL(int, select,
                       (int count, fd_set *readable, fd_set *writable, fd_set *failed, timeval *wait),
                       (count, readable, writable, failed, wait))
@@ -389,13 +407,16 @@ std::string DescribeAppliance(const SpaceNodes &nodes)
 // inside a measured window.
 class Collector {
 public:
-    explicit Collector(const std::string &reply) : request_(kRequestBufferSize)
+    // It listens on a private path, where connect() takes the library.
+    explicit Collector(const std::string &reply)
+        : path_("/tmp/korvsnmp-bench-" + std::to_string(getpid()) + ".sock"), request_(kRequestBufferSize)
     {
-        unlink(kCollectorSocketPath);
+        gPrivateSocketPath = path_;
+        unlink(path_.c_str());
         listenFd_ = socket(AF_UNIX, SOCK_STREAM, 0);
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, kCollectorSocketPath);
+        std::strcpy(address.sun_path, path_.c_str());
         if (bind(listenFd_, reinterpret_cast<sockaddr *>(&address), sizeof address) != 0 ||
             listen(listenFd_, 16) != 0) {
             std::perror("benchmark collector");
@@ -412,7 +433,7 @@ public:
         close(Connect());  // wakes the accept
         server_.join();
         close(listenFd_);
-        unlink(kCollectorSocketPath);
+        unlink(path_.c_str());
     }
 
     static int Connect()
@@ -427,6 +448,7 @@ public:
 
 private:
     static constexpr size_t kRequestBufferSize = 65536;
+    const std::string path_;
 
     // Reads one whole request frame: its length, then that many bytes.
     bool ReadRequest(int fd)

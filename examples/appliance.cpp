@@ -176,8 +176,9 @@ Appliance MakeAppliance(const ApplianceShape &shape, const std::vector<SpaceDevi
     AddDisks(shape, host, data["DiskIO"] = Json::Value(Json::arrayValue));
     AddSpaces(shape, spaceDevices, host, data["SpaceIO"] = Json::Value(Json::arrayValue));
     AddLuns(shape, host, data["iSCSI"] = Json::Value(Json::arrayValue));
-    data["NFS"]["read"] = 10;
-    data["NFS"]["write"] = 20;
+    data["NFS"]["calls"] = 30;
+    data["NFS"]["read_byte"] = 1048576;
+    data["NFS"]["write_byte"] = 524288;
     data["time"] = kSampleTime;
     return appliance;
 }

@@ -1,11 +1,8 @@
 // korvsnmp-stat's command line, its tables, its OpenMetrics text and --watch.
 #include <signal.h>
 #include <sys/wait.h>
-#include <time.h>
 #include <unistd.h>
 
-#include <algorithm>
-#include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
@@ -24,61 +21,41 @@
 
 namespace {
 
-using korvstat::Action;
-using korvstat::Format;
-using korvstat::Options;
+using namespace korvstat;
+using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
-struct OptionsCase {
-    std::vector<std::string> arguments;
-    Action action;
-    Format format;
-    std::vector<std::string> resources;
-    std::string reason;
-};
+auto Fields(const Options &o)
+{
+    return std::tie(o.action, o.format, o.resources, o.reason, o.rawNumbers, o.watchSeconds, o.watchCount);
+}
 
 TEST(KorvsnmpStatOptions, CommandLinesThatParse)
 {
-    const OptionsCase cases[] = {
-        {{}, Action::Statistics, Format::PrettyJson, {"all"}, ""},
-        {{"--resource", "cpu,disk", "--format", "table"}, Action::Statistics, Format::Table,
-         {"cpu", "disk"}, ""},
-        {{"--resource=cpu,disk", "--format=openmetrics"}, Action::Statistics, Format::OpenMetrics,
-         {"cpu", "disk"}, ""},
-        {{"--compact"}, Action::Statistics, Format::CompactJson, {"all"}, ""},
-        {{"--format", "json", "--compact"}, Action::Statistics, Format::CompactJson, {"all"}, ""},
-        {{"--reload"}, Action::Reload, Format::PrettyJson, {"all"}, ""},
-        {{"--history-mode", "backup window"}, Action::HistoryMode, Format::PrettyJson, {"all"},
-         "backup window"},
-        {{"--history-mode=backup=nightly"}, Action::HistoryMode, Format::PrettyJson, {"all"},
-         "backup=nightly"},
-        {{"-h"}, Action::Help, Format::PrettyJson, {"all"}, ""},
-        {{"--version"}, Action::Version, Format::PrettyJson, {"all"}, ""},
+    const std::pair<std::vector<std::string>, void (*)(Options &)> cases[] = {  // the defaults, changed
+        {{}, [](Options &) {}},
+        {{"--resource", "cpu,disk", "--format=table", "--watch=0.5", "--bytes"}, [](Options &o) {
+             o.format = Format::Table, o.resources = {"cpu", "disk"}, o.watchSeconds = 0.5, o.rawNumbers = true;
+         }},
+        {{"--resource=nfs", "--format", "openmetrics", "--watch", "2", "--watch-count", "3"}, [](Options &o) {
+             o.format = Format::OpenMetrics, o.resources = {"nfs"}, o.watchSeconds = 2, o.watchCount = 3;
+         }},
+        {{"--compact"}, [](Options &o) { o.format = Format::CompactJson; }},
+        {{"--format", "json", "--compact"}, [](Options &o) { o.format = Format::CompactJson; }},
+        {{"--history-mode", "backup window"},
+         [](Options &o) { o.action = Action::HistoryMode, o.reason = "backup window"; }},
+        {{"--reload"}, [](Options &o) { o.action = Action::Reload; }},
+        {{"-h"}, [](Options &o) { o.action = Action::Help; }},
+        {{"--version"}, [](Options &o) { o.action = Action::Version; }},
     };
-    for (const OptionsCase &c : cases) {
-        Options options;
+    for (const auto &[arguments, change] : cases) {
+        Options parsed, expected;
         std::string error;
-        ASSERT_TRUE(korvstat::ParseOptions(c.arguments, options, error)) << error;
-        EXPECT_EQ(options.action, c.action);
-        EXPECT_EQ(options.format, c.format);
-        EXPECT_EQ(options.resources, c.resources);
-        EXPECT_EQ(options.reason, c.reason);
+        ASSERT_TRUE(ParseOptions(arguments, parsed, error)) << error;
+        change(expected);
+        EXPECT_EQ(Fields(parsed), Fields(expected)) << ::testing::PrintToString(arguments);
     }
-}
-
-TEST(KorvsnmpStatOptions, WatchAndBytesTakeTheirValues)
-{
-    Options options;
-    std::string error;
-    ASSERT_TRUE(korvstat::ParseOptions({"--watch=0.5", "--format", "table", "--bytes"}, options, error))
-        << error;
-    EXPECT_EQ(options.watchSeconds, 0.5);
-    EXPECT_EQ(options.watchCount, 0u);
-    EXPECT_TRUE(options.rawNumbers);
-    ASSERT_TRUE(korvstat::ParseOptions({"--watch", "2", "--watch-count", "3"}, options, error)) << error;
-    EXPECT_EQ(options.watchSeconds, 2);
-    EXPECT_EQ(options.watchCount, 3u);
 }
 
 TEST(KorvsnmpStatOptions, BadCommandLinesSayWhatIsWrong)
@@ -86,31 +63,18 @@ TEST(KorvsnmpStatOptions, BadCommandLinesSayWhatIsWrong)
     const std::pair<std::vector<std::string>, std::string> cases[] = {
         {{"--resource", "cpu,bogus"}, "unknown resource \"bogus\""},
         {{"--resource", ""}, "--resource needs at least one name"},
-        {{"--resource"}, "--resource needs a value"},
-        {{"--history-mode"}, "--history-mode needs a value"},
-        {{"--history-mode", ""}, "--history-mode needs a reason that is not empty"},
         {{"--history-mode= \t"}, "--history-mode needs a reason that is not empty"},
-        {{"--format", "xml"}, "unknown format \"xml\""},
-        {{"--verbose"}, "unknown option \"--verbose\""},
-        {{"-x"}, "unknown option \"-x\""},
-        {{"table"}, "unexpected argument \"table\""},
-        {{"--compact=yes"}, "--compact takes no value"},
-        {{"--help=me"}, "--help takes no value"},
-        // conflicts, in either order
-        {{"--compact", "--format", "table"}, "--compact applies to --format json only"},
+        {{"--resource"}, "--resource needs a value"}, {{"--format", "xml"}, "unknown format \"xml\""},
+        {{"--verbose"}, "unknown option \"--verbose\""}, {{"-x"}, "unknown option \"-x\""},
+        {{"table"}, "unexpected argument \"table\""}, {{"--help=me"}, "--help takes no value"},
+        // conflicts: named in a fixed order, whatever the command line's
         {{"--format=openmetrics", "--compact"}, "--compact applies to --format json only"},
-        {{"--reload", "--resource", "disk"}, "--reload and --resource cannot be combined"},
         {{"--resource", "disk", "--reload"}, "--reload and --resource cannot be combined"},
-        {{"--history-mode", "x", "--format", "table"}, "--history-mode and --format cannot be combined"},
-        {{"--reload", "--history-mode", "x"}, "--reload and --history-mode cannot be combined"},
         {{"--version", "--help"}, "--help and --version cannot be combined"},
-        {{"--watch", "1", "--reload"}, "--reload and --watch cannot be combined"},
-        {{"--bytes"}, "--bytes applies to --format table only"},
         {{"--format", "table", "--format", "json"}, "--format given more than once"},
+        {{"--bytes"}, "--bytes applies to --format table only"},
         {{"--watch-count", "2"}, "--watch-count needs --watch"},
-        // watch intervals
         {{"--watch", "0"}, "--watch needs seconds from 0.1 to 86400, not \"0\""},
-        {{"--watch", "abc"}, "--watch needs seconds from 0.1 to 86400, not \"abc\""},
         {{"--watch=nan"}, "--watch needs seconds from 0.1 to 86400, not \"nan\""},
         {{"--watch=1e9"}, "--watch needs seconds from 0.1 to 86400, not \"1e9\""},
         {{"--watch=2s"}, "--watch needs seconds from 0.1 to 86400, not \"2s\""},
@@ -119,7 +83,7 @@ TEST(KorvsnmpStatOptions, BadCommandLinesSayWhatIsWrong)
     for (const auto &[arguments, expected] : cases) {
         Options options;
         std::string error;
-        EXPECT_FALSE(korvstat::ParseOptions(arguments, options, error)) << expected;
+        EXPECT_FALSE(ParseOptions(arguments, options, error)) << expected;
         EXPECT_EQ(error, expected);
     }
 }
@@ -133,38 +97,13 @@ std::vector<std::string> Lines(const std::string &text)
     return lines;
 }
 
-// Sets TZ for one scope, for local times that the test can spell out.
-class ScopedTimeZone {
-public:
-    explicit ScopedTimeZone(const char *zone)
-    {
-        const char *old = getenv("TZ");
-        had_ = old != nullptr;
-        if (had_)
-            old_ = old;
-        setenv("TZ", zone, 1);
-        tzset();
-    }
-    ~ScopedTimeZone()
-    {
-        if (had_)
-            setenv("TZ", old_.c_str(), 1);
-        else
-            unsetenv("TZ");
-        tzset();
-    }
-
-private:
-    bool had_ = false;
-    std::string old_;
-};
-
-// The counter tables of the three kinds of record agree: names, then
-// utilization, reads, writes, with units; "total" last even where the
-// result has it first; members of unknown meaning last.
-TEST(KorvsnmpStatTables, EveryCounterTableHasOneColumnOrderAndTotalLast)
+// Every section in its fixed order; the counter tables of the three kinds of
+// record agree: names, then utilization, reads, writes, with units; "total"
+// last even where the result has it first; members of unknown meaning last.
+TEST(KorvsnmpStatTables, OneColumnOrderTotalLastAndBytesOnRequest)
 {
     const Json::Value result = korvtest::ParseJson(R"({
+        "nfs": {"calls": 12, "read_byte": 2048, "write_byte": 0},
         "network": [{"device": "total", "rx": 3072, "tx": 10}, {"device": "eth0", "rx": 3072, "tx": 10}],
         "disk": {"disk": [{"write_byte": 0, "read_byte": 1536, "utilization": 7, "type": "internal",
                            "display_name": "Disk 1", "device": "sda", "write_access": 2,
@@ -174,56 +113,13 @@ TEST(KorvsnmpStatTables, EveryCounterTableHasOneColumnOrderAndTotalLast)
         "space": {"volume": [{"device": "dm-0", "display_name": "home", "read_byte": 1048575}],
                   "total": {"device": "total", "read_byte": 1048575}},
         "lun": [{"uuid": "6e1f", "lun_name": "vm", "write_byte": 4294967295}],
-        "time": 1795000000})");
-    ScopedTimeZone zone("Asia/Kolkata");
-
-    std::ostringstream out;
-    korvstat::WriteTables(result, false, out);
-
-    EXPECT_THAT(Lines(out.str()), ElementsAre(
-        "Sample time  2026-11-18T16:36:40+05:30",
-        "",
-        "Network interfaces",
-        "device  rx (B/s)  tx (B/s)",
-        "eth0        3.0K        10",
-        "total       3.0K        10",
-        "",
-        "Disks",
-        "device  display_name  type      utilization (%)  read_access (/s)  read_byte (B/s)  "
-        "write_access (/s)  write_byte (B/s)  extra",
-        "sda     Disk 1        internal                7                 3             1.5K  "
-        "                2                 0  x",
-        "total   -             -                       7                 3             1.5K  "
-        "                2                 0  -",
-        "",
-        "Volumes",
-        "device  display_name  utilization (%)  read_access (/s)  read_byte (B/s)  write_access (/s)  "
-        "write_byte (B/s)",
-        "dm-0    home                        -                 -             1.0M                  -  "
-        "               -",
-        "total   -                           -                 -             1.0M                  -  "
-        "               -",
-        "",
-        "iSCSI LUNs",
-        "uuid  lun_name  utilization (%)  read_access (/s)  read_byte (B/s)  write_access (/s)  "
-        "write_byte (B/s)",
-        "6e1f  vm                      -                 -                -                  -  "
-        "            4.0G",
-        ""));
-}
-
-TEST(KorvsnmpStatTables, CpuAndMemoryInAFixedOrderWithBytesOnRequest)
-{
-    const Json::Value result = korvtest::ParseJson(R"({
         "cpu": {"idle": 88, "iowait": 1, "nice": 0, "steal": 0, "system": 3, "user": 8, "zz": 1},
         "memory": {"avail_real": 1024, "avail_swap": 0, "buffer": 1, "cached": 2, "free_real": 3,
                    "memory_size": 4294967295, "total_real": 2048, "total_swap": 0},
-        "nfs": {"calls": 12, "read_byte": 2048, "write_byte": 0},
         "time": "soon"})");
-
     std::ostringstream human, raw;
-    korvstat::WriteTables(result, false, human);
-    korvstat::WriteTables(result, true, raw);
+    WriteTables(result, false, human);
+    WriteTables(result, true, raw);
 
     EXPECT_THAT(Lines(human.str()), ElementsAre(
         "Sample time  soon", "",
@@ -232,10 +128,30 @@ TEST(KorvsnmpStatTables, CpuAndMemoryInAFixedOrderWithBytesOnRequest)
         "Memory", "member       size (B)", "memory_size      4.0T", "total_real       2.0M",
         "avail_real       1.0M", "free_real        3.0K", "buffer           1.0K", "cached           2.0K",
         "total_swap          0", "avail_swap          0", "",
-        "NFS", "read_byte (B/s)  write_byte (B/s)  calls (/s)",
+        "Network interfaces", "device  rx (B/s)  tx (B/s)", "eth0        3.0K        10",
+        "total       3.0K        10", "", "Disks",
+        "device  display_name  type      utilization (%)  read_access (/s)  read_byte (B/s)  "
+        "write_access (/s)  write_byte (B/s)  extra",
+        "sda     Disk 1        internal                7                 3             1.5K  "
+        "                2                 0  x",
+        "total   -             -                       7                 3             1.5K  "
+        "                2                 0  -",
+        "", "Volumes",
+        "device  display_name  utilization (%)  read_access (/s)  read_byte (B/s)  write_access (/s)  "
+        "write_byte (B/s)",
+        "dm-0    home                        -                 -             1.0M                  -  "
+        "               -",
+        "total   -                           -                 -             1.0M                  -  "
+        "               -",
+        "", "iSCSI LUNs",
+        "uuid  lun_name  utilization (%)  read_access (/s)  read_byte (B/s)  write_access (/s)  "
+        "write_byte (B/s)",
+        "6e1f  vm                      -                 -                -                  -  "
+        "            4.0G",
+        "", "NFS", "read_byte (B/s)  write_byte (B/s)  calls (/s)",
         "           2.0K                 0          12", ""));
-    EXPECT_THAT(Lines(raw.str()), ::testing::Contains("memory_size  4398046510080"));
-    EXPECT_THAT(Lines(raw.str()), ::testing::Contains("           2048                 0          12"));
+    EXPECT_THAT(Lines(raw.str()), Contains("memory_size  4398046510080"));
+    EXPECT_THAT(Lines(raw.str()), Contains("           2048                 0          12"));
 }
 
 TEST(KorvsnmpStatTables, ValuesOfUnexpectedShapesAreShownNotThrown)
@@ -245,15 +161,16 @@ TEST(KorvsnmpStatTables, ValuesOfUnexpectedShapesAreShownNotThrown)
                    "network": {"device": "x"}, "disk": {"disk": 5, "total": true},
                    "time": 1e300})");
     std::ostringstream out;
-    korvstat::WriteTables(result, false, out);
+    WriteTables(result, false, out);
     EXPECT_THAT(out.str(), HasSubstr("[2]"));
     EXPECT_THAT(out.str(), HasSubstr("Sample time  1.0000000000000001e+300"));
     std::ostringstream scalar;
-    korvstat::WriteTables(Json::Value(5), false, scalar);
+    WriteTables(Json::Value(5), false, scalar);
     EXPECT_EQ(scalar.str(), "5\n");
 }
 
-TEST(KorvsnmpStatTables, HumanBytesRoundLikeDf)
+// Human bytes round like df -h; exact text scales KiB without overflow.
+TEST(KorvsnmpStatTables, HumanBytesAndExactText)
 {
     const std::pair<double, const char *> cases[] = {
         {0, "0"},           {1023, "1023"},         {1024, "1.0K"},        {1536, "1.5K"},
@@ -261,93 +178,86 @@ TEST(KorvsnmpStatTables, HumanBytesRoundLikeDf)
         {4398046510080.0, "4.0T"}, {1.2e21, "1041E"},
     };
     for (const auto &[bytes, expected] : cases)
-        EXPECT_EQ(korvstat::HumanBytes(bytes), expected) << bytes;
-}
-
-TEST(KorvsnmpStatTables, ExactTextScalesKibibytesWithoutOverflow)
-{
-    using korvstat::Unit;
-    const std::tuple<const char *, Unit, const char *> cases[] = {
-        {"4294967295", Unit::KiB, "4398046510080"},
-        {"18446744073709551615", Unit::KiB, "1.888946593147858e+22"},
-        {"18446744073709551615", Unit::PerSecond, "18446744073709551615"},
-        {"-3", Unit::KiB, "-3072"},
-        {"0.5", Unit::KiB, "512"},
-        {"true", Unit::PerSecond, ""},
-        {"\"7\"", Unit::PerSecond, ""},
+        EXPECT_EQ(HumanBytes(bytes), expected) << bytes;
+    const std::tuple<const char *, Unit, const char *> exact[] = {
+        {"4294967295", Unit::KiB, "4398046510080"}, {"-3", Unit::KiB, "-3072"}, {"0.5", Unit::KiB, "512"},
+        {"18446744073709551615", Unit::KiB, "1.888946593147858e+22"}, {"true", Unit::PerSecond, ""},
+        {"18446744073709551615", Unit::PerSecond, "18446744073709551615"}, {"\"7\"", Unit::PerSecond, ""},
     };
-    for (const auto &[json, unit, expected] : cases)
-        EXPECT_EQ(korvstat::ExactText(korvtest::ParseJson(json), unit), expected) << json;
+    for (const auto &[json, unit, expected] : exact)
+        EXPECT_EQ(ExactText(korvtest::ParseJson(json), unit), expected) << json;
 }
 
 TEST(KorvsnmpStatOpenMetrics, LabelValuesAreEscapedAndValidUtf8)
 {
     const std::pair<std::string, std::string> cases[] = {
-        {"Disk 1", "Disk 1"},
-        {"say \"hi\"", "say \\\"hi\\\""},
-        {"C:\\share", "C:\\\\share"},
-        {"two\nlines", "two\\nlines"},
-        {"Datenträger 🙂", "Datenträger 🙂"},
-        {"latin1 \xE4!", "latin1 \xEF\xBF\xBD!"},
+        {"Disk 1", "Disk 1"},            {"say \"hi\"", "say \\\"hi\\\""},
+        {"C:\\share", "C:\\\\share"},    {"two\nlines", "two\\nlines"},
+        {"Datenträger 🙂", "Datenträger 🙂"}, {"latin1 \xE4!", "latin1 \xEF\xBF\xBD!"},
         {"\xC0\xAF", "\xEF\xBF\xBD\xEF\xBF\xBD"},              // overlong '/'
         {"\xED\xA0\x80", "\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"},  // a surrogate
         {"cut \xE2\x82", "cut \xEF\xBF\xBD\xEF\xBF\xBD"},      // sequence cut short
     };
     for (const auto &[text, expected] : cases)
-        EXPECT_EQ(korvstat::EscapeLabelValue(text), expected) << text;
+        EXPECT_EQ(EscapeLabelValue(text), expected) << text;
 }
 
-struct CommandRun {
+struct Outcome {
     int status;
-    std::string out;
+    std::string out, err;
 };
 
-// Runs a shell command with `input` on its standard input.
-CommandRun RunWithInput(const std::string &command, const std::string &input)
+// Runs shell `command` with `input` on its standard input.
+Outcome RunCommand(const std::string &command, const std::string &input = "")
 {
-    char pattern[] = "/tmp/korvsnmp-stat-in-XXXXXX";
-    const int fd = mkstemp(pattern);
-    EXPECT_EQ(write(fd, input.data(), input.size()), static_cast<ssize_t>(input.size()));
-    close(fd);
-    CommandRun run{-1, ""};
-    FILE *pipe = popen((command + " <" + pattern + " 2>&1").c_str(), "r");
-    if (pipe != nullptr) {
-        char buffer[4096];
-        for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-            run.out.append(buffer, n);
-        const int status = pclose(pipe);
-        run.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    }
-    unlink(pattern);
+    char in[] = "/tmp/korvsnmp-stat-XXXXXX", out[] = "/tmp/korvsnmp-stat-XXXXXX",
+         err[] = "/tmp/korvsnmp-stat-XXXXXX";
+    for (char *path : {in, out, err})
+        close(mkstemp(path));
+    std::ofstream(in, std::ios::binary) << input;
+    const int status = std::system(("{ " + command + "; } <" + in + " >" + out + " 2>" + err).c_str());
+    auto text = [](const char *path) {
+        std::ifstream file(path, std::ios::binary);
+        return std::string(std::istreambuf_iterator<char>(file), {});
+    };
+    const Outcome run{WIFEXITED(status) ? WEXITSTATUS(status) : -1, text(out), text(err)};
+    for (const char *path : {in, out, err})
+        unlink(path);
     return run;
 }
 
+// Runs the built korvsnmp-stat with `arguments` (shell words, then maybe more
+// of the shell's), `environment` (shell assignments) before it.
+Outcome RunStat(const std::string &arguments, const std::string &environment = "")
+{
+    return RunCommand(korvtest::RedirectedChildPrefix() + environment + " " KORVSNMP_STAT_PATH " " + arguments);
+}
+
 // The samples that both Prometheus parsers read from `exposition`, as
-// "<family> <unit> <sample> <labels> <value>"; fails the test when either
-// parser rejects it or they disagree on a sample.
+// "<sample> <unit> <labels> <value>"; fails the test when either parser
+// rejects it, names a family other than its gauge, or lacks a sample.
 std::vector<std::string> ParsedSamples(const std::string &exposition)
 {
-    const CommandRun run = RunWithInput(KORVSNMP_OPENMETRICS_SAMPLES, exposition);
-    EXPECT_EQ(run.status, 0) << run.out << "\n" << exposition;
-    std::vector<std::string> openmetrics, classic;
+    const Outcome run = RunCommand(KORVSNMP_OPENMETRICS_SAMPLES, exposition);
+    EXPECT_EQ(run.status, 0) << run.out << run.err << "\n" << exposition;
+    std::vector<std::string> openmetrics, unitless, classic;
     for (const std::string &line : Lines(run.out)) {
-        const size_t space = line.find(' ');
-        (line.compare(0, space, "openmetrics") == 0 ? openmetrics : classic)
-            .push_back(line.substr(space + 1));
+        std::istringstream words(line);
+        std::string parser, family, unit, sample, rest;
+        words >> parser >> family >> unit >> sample;
+        std::getline(words, rest);
+        EXPECT_EQ(family, sample) << line;
+        // The classic parser knows no units and reads every value as a float.
+        (parser == "classic" ? classic : unitless).push_back(sample + rest);
+        if (parser == "openmetrics")
+            openmetrics.push_back(sample + " " + unit + rest);
     }
-    // The classic parser knows no units and reads every value as a float.
-    for (std::string &sample : openmetrics) {
-        std::istringstream words(sample);
-        std::string family, unit;
-        words >> family >> unit;
-        std::string rest = sample.substr(family.size() + unit.size() + 2);
-        const std::string classicForm = family + " - " + rest;
-        EXPECT_THAT(classic, ::testing::Contains(classicForm)) << "classic parser lacks " << sample;
-    }
+    for (const std::string &sample : unitless)
+        EXPECT_THAT(classic, Contains(sample)) << "the classic parser lacks it";
     return openmetrics;
 }
 
-TEST(KorvsnmpStatOpenMetrics, TheParsersReadEveryNamedRecord)
+TEST(KorvsnmpStatOpenMetrics, TheParsersReadEveryNamedRecordAndNothingElse)
 {
     const Json::Value result = korvtest::ParseJson(R"({
         "memory": {"total_real": 2048, "memory_size": 4294967295},
@@ -362,133 +272,74 @@ TEST(KorvsnmpStatOpenMetrics, TheParsersReadEveryNamedRecord)
         "nfs": {"calls": 12},
         "time": 1795000000})");
     std::ostringstream out;
-    korvstat::WriteOpenMetrics(result, out);
+    WriteOpenMetrics(result, out);
 
+    const std::string sda = R"({"device": "sda", "display_name": "Disk \"1\" \\ a\nb", "type": "usb"})";
     EXPECT_THAT(Lines(out.str()).back(), "# EOF");
     EXPECT_THAT(ParsedSamples(out.str()), ElementsAre(
-        "korvsnmp_memory_size_bytes bytes korvsnmp_memory_size_bytes {} 4398046510080.0",
-        "korvsnmp_memory_total_real_bytes bytes korvsnmp_memory_total_real_bytes {} 2097152.0",
-        "korvsnmp_network_receive_bytes_per_second bytes_per_second "
-        "korvsnmp_network_receive_bytes_per_second {\"device\": \"total\"} 6.0",
-        "korvsnmp_network_receive_bytes_per_second bytes_per_second "
-        "korvsnmp_network_receive_bytes_per_second {\"device\": \"eth0\"} 3.0",
-        "korvsnmp_network_transmit_bytes_per_second bytes_per_second "
-        "korvsnmp_network_transmit_bytes_per_second {\"device\": \"total\"} 0.0",
-        "korvsnmp_network_transmit_bytes_per_second bytes_per_second "
-        "korvsnmp_network_transmit_bytes_per_second {\"device\": \"eth0\"} 0.0",
-        "korvsnmp_disk_utilization_percent percent korvsnmp_disk_utilization_percent "
-        "{\"device\": \"sda\", \"display_name\": \"Disk \\\"1\\\" \\\\ a\\nb\", \"type\": \"usb\"} 7.0",
-        "korvsnmp_disk_utilization_percent percent korvsnmp_disk_utilization_percent "
-        "{\"device\": \"total\"} 7.0",
-        "korvsnmp_disk_read_bytes_per_second bytes_per_second korvsnmp_disk_read_bytes_per_second "
-        "{\"device\": \"sda\", \"display_name\": \"Disk \\\"1\\\" \\\\ a\\nb\", \"type\": \"usb\"} 1536.0",
-        "korvsnmp_disk_read_bytes_per_second bytes_per_second korvsnmp_disk_read_bytes_per_second "
-        "{\"device\": \"total\"} 1536.0",
-        "korvsnmp_disk_queue_depth - korvsnmp_disk_queue_depth "
-        "{\"device\": \"sda\", \"display_name\": \"Disk \\\"1\\\" \\\\ a\\nb\", \"type\": \"usb\"} 2.0",
-        "korvsnmp_volume_write_bytes_per_second bytes_per_second korvsnmp_volume_write_bytes_per_second "
-        "{\"device\": \"dm-0\", \"display_name\": \"h\\u00e4me \\u00ff\"} 1.0",
-        "korvsnmp_volume_write_bytes_per_second bytes_per_second korvsnmp_volume_write_bytes_per_second "
-        "{\"device\": \"total\"} 1.0",
-        "korvsnmp_lun_read_accesses_per_second accesses_per_second "
-        "korvsnmp_lun_read_accesses_per_second {\"device\": \"6e1f\", \"display_name\": \"vm\"} 4.5",
-        "korvsnmp_nfs_calls_per_second calls_per_second korvsnmp_nfs_calls_per_second {} 12.0",
-        "korvsnmp_sample_timestamp_seconds seconds korvsnmp_sample_timestamp_seconds {} 1795000000.0"));
-}
-
-TEST(KorvsnmpStatOpenMetrics, NothingButEofForAResultWithoutNumbers)
-{
-    const char *const cases[] = {"null", "[]", R"({"cpu": [1], "disk": 3, "time": "x"})"};
-    for (const char *json : cases) {
+        "korvsnmp_memory_size_bytes bytes {} 4398046510080.0",
+        "korvsnmp_memory_total_real_bytes bytes {} 2097152.0",
+        R"(korvsnmp_network_receive_bytes_per_second bytes_per_second {"device": "total"} 6.0)",
+        R"(korvsnmp_network_receive_bytes_per_second bytes_per_second {"device": "eth0"} 3.0)",
+        R"(korvsnmp_network_transmit_bytes_per_second bytes_per_second {"device": "total"} 0.0)",
+        R"(korvsnmp_network_transmit_bytes_per_second bytes_per_second {"device": "eth0"} 0.0)",
+        "korvsnmp_disk_utilization_percent percent " + sda + " 7.0",
+        R"(korvsnmp_disk_utilization_percent percent {"device": "total"} 7.0)",
+        "korvsnmp_disk_read_bytes_per_second bytes_per_second " + sda + " 1536.0",
+        R"(korvsnmp_disk_read_bytes_per_second bytes_per_second {"device": "total"} 1536.0)",
+        "korvsnmp_disk_queue_depth - " + sda + " 2.0",
+        R"(korvsnmp_volume_write_bytes_per_second bytes_per_second {"device": "dm-0", )"
+        R"("display_name": "h\u00e4me \u00ff"} 1.0)",
+        R"(korvsnmp_volume_write_bytes_per_second bytes_per_second {"device": "total"} 1.0)",
+        R"(korvsnmp_lun_read_accesses_per_second accesses_per_second {"device": "6e1f", )"
+        R"("display_name": "vm"} 4.5)",
+        "korvsnmp_nfs_calls_per_second calls_per_second {} 12.0",
+        "korvsnmp_sample_timestamp_seconds seconds {} 1795000000.0"));
+    // A result without numbers: nothing but the end.
+    for (const char *json : {"null", "[]", R"({"cpu": [1], "disk": 3, "time": "x"})"}) {
         std::ostringstream out;
-        korvstat::WriteOpenMetrics(korvtest::ParseJson(json), out);
+        WriteOpenMetrics(korvtest::ParseJson(json), out);
         EXPECT_EQ(out.str(), "# EOF\n") << json;
     }
 }
 
 TEST(KorvsnmpStatWatch, DrawsWaitsAndStopsOnCountOrInterruption)
 {
-    struct Case {
-        unsigned count;
-        int waitsBeforeInterrupt;  // -1: never interrupted
-        int draws;
-        int status;
+    // {count, waits before the interruption (-1: none), draws, status}
+    const std::tuple<unsigned, int, int, int> cases[] = {
+        {1, -1, 1, 7}, {3, -1, 3, 7},  // the count's draws, a wait between, the last status
+        {0, 4, 5, 0},  {9, 1, 2, 0},   // until interrupted, then 0
     };
-    const Case cases[] = {
-        {1, -1, 1, 7},  // one draw, no wait, its status
-        {3, -1, 3, 7},
-        {0, 4, 5, 0},   // no limit: until interrupted, then 0
-        {9, 1, 2, 0},
-    };
-    for (const Case &c : cases) {
+    for (const auto &[count, waitsBeforeInterrupt, expectedDraws, expectedStatus] : cases) {
         int draws = 0;
         std::vector<std::chrono::milliseconds> waits;
-        const int status = korvstat::Watch(
-            std::chrono::milliseconds(2500), c.count, [&] { return ++draws, 7; },
+        const int status = Watch(
+            std::chrono::milliseconds(2500), count, [&] { return ++draws, 7; },
             [&](std::chrono::milliseconds interval) {
                 waits.push_back(interval);
-                return static_cast<int>(waits.size()) != c.waitsBeforeInterrupt + 1;
+                return static_cast<int>(waits.size()) != waitsBeforeInterrupt + 1;
             });
-        EXPECT_EQ(draws, c.draws);
-        EXPECT_EQ(status, c.status);
-        EXPECT_EQ(waits.size(), static_cast<size_t>(c.draws - (c.status == 0 ? 0 : 1)));
-        for (auto interval : waits)
-            EXPECT_EQ(interval.count(), 2500);
+        EXPECT_EQ(draws, expectedDraws);
+        EXPECT_EQ(status, expectedStatus);
+        EXPECT_EQ(waits, std::vector<std::chrono::milliseconds>(
+                             expectedDraws - (expectedStatus == 0 ? 0 : 1), std::chrono::milliseconds(2500)));
     }
 }
 
-// A signal pending before the wait ends it at once, however long the
-// interval; without one, a zero interval returns as a timeout.
+// A pending SIGINT (SIGTERM: the program's --watch test) ends the wait at
+// once, however long the interval; without one, a zero interval returns as a timeout.
 TEST(KorvsnmpStatWatch, TheWaitEndsOnAPendingStopSignal)
 {
-    for (int signal : {SIGINT, SIGTERM}) {
-        sigset_t stop, previous;
-        sigemptyset(&stop);
-        sigaddset(&stop, signal);
-        sigprocmask(SIG_BLOCK, &stop, &previous);
-        raise(signal);
-        EXPECT_FALSE(korvstat::WaitUnlessInterrupted(std::chrono::hours(1)));
-        sigset_t pending;
-        sigpending(&pending);
-        EXPECT_FALSE(sigismember(&pending, signal)) << "the signal was taken";
-        sigprocmask(SIG_SETMASK, &previous, nullptr);
-    }
-    EXPECT_TRUE(korvstat::WaitUnlessInterrupted(std::chrono::milliseconds(0)));
-}
-
-}  // namespace
-
-namespace {
-
-struct ProgramRun {
-    int status;
-    std::string out;
-    std::string err;
-};
-
-// Runs the built korvsnmp-stat with `arguments` (shell words), `environment`
-// (shell assignments) before it.
-ProgramRun RunStat(const std::string &arguments, const std::string &environment = "")
-{
-    char pattern[] = "/tmp/korvsnmp-stat-err-XXXXXX";
-    int errFd = mkstemp(pattern);
-    close(errFd);
-    const std::string command =
-        korvtest::RedirectedChildPrefix() + environment + " " + KORVSNMP_STAT_PATH + " " + arguments +
-        " 2>" + pattern;
-    ProgramRun run{-1, "", ""};
-    FILE *pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr)
-        return run;
-    char buffer[4096];
-    for (size_t n; (n = fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        run.out.append(buffer, n);
-    int status = pclose(pipe);
-    run.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    std::ifstream err(pattern);
-    run.err.assign(std::istreambuf_iterator<char>(err), std::istreambuf_iterator<char>());
-    unlink(pattern);
-    return run;
+    sigset_t stop, previous, pending;
+    sigemptyset(&stop);
+    sigaddset(&stop, SIGINT);
+    sigprocmask(SIG_BLOCK, &stop, &previous);
+    raise(SIGINT);
+    EXPECT_FALSE(WaitUnlessInterrupted(std::chrono::hours(1)));
+    sigpending(&pending);
+    EXPECT_FALSE(sigismember(&pending, SIGINT)) << "the signal was taken";
+    sigprocmask(SIG_SETMASK, &previous, nullptr);
+    EXPECT_TRUE(WaitUnlessInterrupted(std::chrono::milliseconds(0)));
 }
 
 const char kCpuAndNfsReply[] =
@@ -500,9 +351,9 @@ TEST(KorvsnmpStatProgram, PrintsTheAssembledResultAsJsonTablesAndOpenMetrics)
     for (int i = 0; i < 3; ++i)
         collector.Script({korvtest::Frame(kCpuAndNfsReply)});
 
-    ProgramRun json = RunStat("--resource cpu,nfs --compact");
-    ProgramRun table = RunStat("--resource=nfs,cpu --format=table", "TZ=America/St_Johns");
-    ProgramRun metrics = RunStat("--resource cpu --format openmetrics");
+    const Outcome json = RunStat("--resource cpu,nfs --compact");
+    const Outcome table = RunStat("--resource=nfs,cpu --format=table", "TZ=America/St_Johns");
+    const Outcome metrics = RunStat("--resource cpu --format openmetrics");
 
     EXPECT_EQ(json.status, 0) << json.err;
     EXPECT_EQ(json.out,
@@ -515,10 +366,9 @@ TEST(KorvsnmpStatProgram, PrintsTheAssembledResultAsJsonTablesAndOpenMetrics)
                             "              5                 -           -", ""));
     EXPECT_EQ(metrics.status, 0) << metrics.err;
     EXPECT_THAT(ParsedSamples(metrics.out),
-                ElementsAre("korvsnmp_cpu_user_percent percent korvsnmp_cpu_user_percent {} 12.0",
-                            "korvsnmp_cpu_idle_percent percent korvsnmp_cpu_idle_percent {} 88.0",
-                            "korvsnmp_sample_timestamp_seconds seconds "
-                            "korvsnmp_sample_timestamp_seconds {} 1795000000.0"));
+                ElementsAre("korvsnmp_cpu_user_percent percent {} 12.0",
+                            "korvsnmp_cpu_idle_percent percent {} 88.0",
+                            "korvsnmp_sample_timestamp_seconds seconds {} 1795000000.0"));
     ASSERT_TRUE(collector.WaitForConnections(3));
     EXPECT_EQ(collector.Requests().at(0),
               korvtest::Frame(std::string("{\"resource\":[\"cpu\",\"nfs\"]}\n") + '\0'));
@@ -527,95 +377,36 @@ TEST(KorvsnmpStatProgram, PrintsTheAssembledResultAsJsonTablesAndOpenMetrics)
 TEST(KorvsnmpStatProgram, NoCollectorIsAClearLineAndAFailingStatus)
 {
     korvtest::NoCollector absent;
-
-    ProgramRun run = RunStat("");
-
+    const Outcome run = RunStat("");
     EXPECT_EQ(run.status, 1);
     EXPECT_EQ(run.out, "");
     EXPECT_THAT(run.err, HasSubstr("Failed to connect to socket: [/tmp/korvsnmpcd.sock]"));  // the library's
-    EXPECT_THAT(Lines(run.err).back(),
-                ::testing::Eq("korvsnmp-stat: no statistics from the collector on /tmp/korvsnmpcd.sock"));
+    EXPECT_EQ(Lines(run.err).back(), "korvsnmp-stat: no statistics from the collector on /tmp/korvsnmpcd.sock");
 }
 
-TEST(KorvsnmpStatProgram, BadCommandLinesExitWithUsageAndVersionAnswers)
+TEST(KorvsnmpStatProgram, BadCommandLineExitsWithUsageAndVersionAnswers)
 {
-    const std::pair<const char *, const char *> cases[] = {
-        {"--format xml", "korvsnmp-stat: unknown format \"xml\"\n\nUsage:"},
-        {"--compact --format table", "korvsnmp-stat: --compact applies to --format json only\n\nUsage:"},
-        {"--reload --resource disk", "korvsnmp-stat: --reload and --resource cannot be combined\n\nUsage:"},
-        {"--history-mode ''", "korvsnmp-stat: --history-mode needs a reason that is not empty\n\nUsage:"},
-    };
-    for (const auto &[arguments, message] : cases) {
-        ProgramRun run = RunStat(arguments);
-        EXPECT_EQ(run.status, 2) << arguments;
-        EXPECT_EQ(run.out, "");
-        EXPECT_THAT(run.err, ::testing::StartsWith(message));
-    }
-    ProgramRun version = RunStat("--version");
+    const Outcome bad = RunStat("--compact --format table");
+    EXPECT_EQ(bad.status, 2);
+    EXPECT_EQ(bad.out, "");
+    EXPECT_THAT(bad.err, ::testing::StartsWith(
+                             "korvsnmp-stat: --compact applies to --format json only\n\nUsage:"));
+    const Outcome version = RunStat("--version");
     EXPECT_EQ(version.status, 0);
     EXPECT_THAT(version.out, ::testing::MatchesRegex("korvsnmp-stat [0-9]+\\.[0-9]+\\.[0-9]+\n"));
 }
 
-// Whether `pid` blocks `signal` now (/proc/PID/status, SigBlk).
-bool Blocks(pid_t pid, int signal)
-{
-    std::ifstream status("/proc/" + std::to_string(pid) + "/status");
-    for (std::string line; std::getline(status, line);)
-        if (line.rfind("SigBlk:", 0) == 0)
-            return (std::stoull(line.substr(7), nullptr, 16) >> (signal - 1)) & 1;
-    return false;
-}
-
-// --watch draws, then waits; SIGTERM in the wait ends it with status 0.
+// --watch draws, then waits; SIGTERM in the wait ends it with status 0. The
+// wait has begun once SIGTERM (bit 14 of /proc/PID/status SigBlk) is blocked.
 TEST(KorvsnmpStatProgram, WatchRedrawsUntilInterrupted)
 {
     korvtest::TestCollector collector;
     collector.Script({korvtest::Frame(kCpuAndNfsReply)});
-    // The child's environment: ours, with the redirection to the test collector.
-    std::vector<std::string> variables = korvtest::RedirectedChildVariables();
-    for (char **variable = environ; *variable != nullptr; ++variable) {
-        const std::string entry = *variable;
-        const std::string key = entry.substr(0, entry.find('=') + 1);
-        if (std::none_of(variables.begin(), variables.end(),
-                         [&](const std::string &v) { return v.rfind(key, 0) == 0; }))
-            variables.push_back(entry);
-    }
-    std::vector<char *> envp;
-    for (std::string &variable : variables)
-        envp.push_back(variable.data());
-    envp.push_back(nullptr);
-    const char *const argv[] = {KORVSNMP_STAT_PATH, "--watch", "3600", "--resource", "nfs",
-                                "--compact", nullptr};
-    int output[2];
-    ASSERT_EQ(pipe(output), 0);
-    const pid_t child = fork();
-    ASSERT_GE(child, 0);
-    if (child == 0) {
-        dup2(output[1], STDOUT_FILENO);
-        close(output[0]);
-        close(output[1]);
-        execve(KORVSNMP_STAT_PATH, const_cast<char *const *>(argv), envp.data());
-        _exit(127);
-    }
-    close(output[1]);
-
-    ASSERT_TRUE(collector.WaitForConnections(1));
-    // The interval's wait has begun once SIGTERM is blocked; poll for it.
-    for (int polls = 0; polls < 5000 && !Blocks(child, SIGTERM); ++polls)
-        usleep(1000);
-    EXPECT_TRUE(Blocks(child, SIGTERM));
-    kill(child, SIGTERM);
-    int status = 0;
-    ASSERT_EQ(waitpid(child, &status, 0), child);
-    std::string out;
-    char buffer[4096];
-    for (ssize_t n; (n = read(output[0], buffer, sizeof buffer)) > 0;)
-        out.append(buffer, static_cast<size_t>(n));
-    close(output[0]);
-
-    ASSERT_TRUE(WIFEXITED(status)) << "ended by signal " << WTERMSIG(status);
-    EXPECT_EQ(WEXITSTATUS(status), 0);
-    EXPECT_EQ(out, "{\"nfs\":{\"read_byte\":5},\"time\":1795000000}\n");  // no escapes: not a terminal
+    const Outcome run = RunStat("--watch 3600 --resource nfs --compact & p=$!; for i in $(seq 1000); do "
+                            "[ $((0x$(sed -n 's/^SigBlk:\\s*//p' /proc/$p/status) >> 14 & 1)) = 1 ] && break; "
+                            "sleep 0.005; done; kill -TERM $p; wait $p");
+    EXPECT_EQ(run.status, 0) << run.err;
+    EXPECT_EQ(run.out, "{\"nfs\":{\"read_byte\":5},\"time\":1795000000}\n");  // no escapes: not a terminal
 }
 
 }  // namespace

@@ -37,15 +37,10 @@ constexpr size_t kNodes = 3;
 const char kReply[] = R"json({"data": {
   "System": [{"user": 10, "system": 5, "idle": 85}],
   "Memory": [{"total_real": 4096000, "avail_real": 1000}],
-  "Network": [
-    {"device": "lo", "rx": 7, "tx": 7},
-    {"device": "eth1", "rx": 10, "tx": 20},
-    {"device": "bond0", "rx": 999, "tx": 999},
-    {"device": "ppp01", "rx": 30, "tx": 40},
-    {"device": "eth0", "rx": 100, "tx": 200},
-    {"device": "eth2", "rx": 1, "tx": 2},
-    {"device": "eth0.5", "rx": 5, "tx": 6},
-    {"device": "ppp0", "rx": 3, "tx": 4}],
+  "Network": [{"device": "lo", "rx": 7, "tx": 7}, {"device": "eth1", "rx": 10, "tx": 20},
+    {"device": "bond0", "rx": 999, "tx": 999}, {"device": "ppp01", "rx": 30, "tx": 40},
+    {"device": "eth0", "rx": 100, "tx": 200}, {"device": "eth2", "rx": 1, "tx": 2},
+    {"device": "eth0.5", "rx": 5, "tx": 6}, {"device": "ppp0", "rx": 3, "tx": 4}],
   "DiskIO": [
     {"device": "sdb", "utilization": 4, "read_access": 2, "read_byte": 4000000000, "write_access": 1, "write_byte": 10},
     {"device": "sda", "utilization": 3, "read_access": 1, "read_byte": 4000000000, "write_access": 1, "write_byte": 10},
@@ -54,11 +49,8 @@ const char kReply[] = R"json({"data": {
     {"device": "nvme0n1", "utilization": 1, "read_access": 0, "read_byte": 0, "write_access": 0, "write_byte": 0},
     {"device": "sdu", "utilization": 0, "read_access": 0, "read_byte": 0, "write_access": 0, "write_byte": 0},
     {"device": "sde", "utilization": 0, "read_access": 0, "read_byte": 0, "write_access": 0, "write_byte": 0}],
-  "SpaceIO": [
-    {"device": "{0}", "read_byte": 1},
-    {"device": "{1}", "read_byte": 2},
-    {"device": "total", "read_byte": 6},
-    {"device": "{2}", "read_byte": 3}],
+  "SpaceIO": [{"device": "{0}", "read_byte": 1}, {"device": "{1}", "read_byte": 2},
+    {"device": "total", "read_byte": 6}, {"device": "{2}", "read_byte": 3}],
   "iSCSI": [{"device": "uuid-a", "read": 1}, {"device": "uuid-c", "read": 2}],
   "NFS": {"read": 5},
   "time": 1795000000}})json";
@@ -66,15 +58,10 @@ const char kReply[] = R"json({"data": {
 const char kExpected[] = R"json({
   "cpu": {"user": 10, "system": 5, "idle": 85},
   "memory": {"total_real": 4096000, "avail_real": 1000, "memory_size": 8192000},
-  "network": [
-    {"device": "total", "rx": 127, "tx": 250},
-    {"device": "eth0", "rx": 100, "tx": 200},
-    {"device": "eth0.5", "rx": 5, "tx": 6},
-    {"device": "eth1", "rx": 10, "tx": 20},
-    {"device": "eth2", "rx": 1, "tx": 2},
-    {"device": "bond0", "rx": 11, "tx": 22},
-    {"device": "ppp01", "rx": 30, "tx": 40},
-    {"device": "ppp0", "rx": 3, "tx": 4}],
+  "network": [{"device": "total", "rx": 127, "tx": 250}, {"device": "eth0", "rx": 100, "tx": 200},
+    {"device": "eth0.5", "rx": 5, "tx": 6}, {"device": "eth1", "rx": 10, "tx": 20},
+    {"device": "eth2", "rx": 1, "tx": 2}, {"device": "bond0", "rx": 11, "tx": 22},
+    {"device": "ppp01", "rx": 30, "tx": 40}, {"device": "ppp0", "rx": 3, "tx": 4}],
   "disk": {
     "disk": [
       {"device": "sdb", "utilization": 4, "read_access": 2, "read_byte": 4000000000, "write_access": 1, "write_byte": 10, "display_name": "Disk 2", "type": "internal"},
@@ -85,8 +72,7 @@ const char kExpected[] = R"json({
       {"device": "sde", "utilization": 0, "read_access": 0, "read_byte": 0, "write_access": 0, "write_byte": 0, "display_name": "eSATA Disk 1", "type": "eSATA"}],
     "total": {"device": "total", "utilization": 3, "read_access": 3, "read_byte": 8000000000, "write_access": 2, "write_byte": 20}},
   "space": {
-    "volume": [
-      {"device": "{0}", "read_byte": 1, "display_name": "volume1"},
+    "volume": [{"device": "{0}", "read_byte": 1, "display_name": "volume1"},
       {"device": "{2}", "read_byte": 3, "display_name": "volume2"}],
     "total": {"device": "total", "read_byte": 6}},
   "lun": [{"uuid": "uuid-a", "lun_name": "LUN A", "read": 1},
@@ -107,27 +93,20 @@ protected:
         host.physMemSize = 8192000;
         host.supportsEBox = true;
         host.files[korvstandin::kStringsFilePath]["volume"] = {
-            {"volume_disk", "Disk"},
-            {"volume_expansion", "Expansion Unit"},
+            {"volume_disk", "Disk"}, {"volume_expansion", "Expansion Unit"},
             {"dedicated_ssd_cache", "SSD Cache"}};
-        host.disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"},
-                      {2, DISK_CONTAINER_INTERNAL, 0, "/dev/sdb"},
-                      {3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"},
-                      {12, DISK_CONTAINER_SSD_CACHE, 1, "/dev/nvme0n1"}};
+        host.disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}, {2, DISK_CONTAINER_INTERNAL, 0, "/dev/sdb"},
+                      {3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"}, {12, DISK_CONTAINER_SSD_CACHE, 1, "/dev/nvme0n1"}};
         host.expansionUnits = {{1, {"/dev/sdx"}, std::string("Korvel-X7"), true},
                                {2, {"/dev/sdc"}, std::string("Korvel-X5"), true}};
         host.usb.devices = {{"sdu", "USB Disk 1"}};
         host.esata.devices = {{"sde", "eSATA Disk 1"}};
-        host.interfaces = {{"eth2"},
-                           {"eth0"},
-                           {"bond0", NetRole::Aggregation, "", "", {"eth1", "eth2"}},
-                           {"eth1"},
-                           {"eth0.5", NetRole::Vlan, "eth0", "eth0.5"}};
+        host.interfaces = {{"eth2"}, {"eth0"}, {"bond0", NetRole::Aggregation, "", "", {"eth1", "eth2"}},
+                           {"eth1"}, {"eth0.5", NetRole::Vlan, "eth0", "eth0.5"}};
         host.pppoeInterface = "ppp0";
         host.spaces = {{nodes_.Node(0), "volume1"}, {nodes_.Node(1), "volume2"}};
         host.flashCaches = {{nodes_.Node(1), "/volume2", nodes_.Node(2)}};
-        host.luns = {{Json::Value("uuid-a"), Json::Value("LUN A")},
-                     {Json::Value("uuid-b"), Json::Value("LUN B")}};
+        host.luns = {{Json::Value("uuid-a"), "LUN A"}, {Json::Value("uuid-b"), "LUN B"}};
     }
 
     korvtest::BlockNodes nodes_;
@@ -136,10 +115,8 @@ protected:
 TEST_F(WholeRoadTest, CollectorReplyBecomesTheNamedResult)
 {
     korvtest::TestCollector collector;
-    const std::string reply = WithNames(kReply, nodes_, kNodes);
-    collector.Script({korvtest::Frame(reply + '\0')});
-    Json::Value request(Json::objectValue);
-    request["resource"].append("all");
+    collector.Script({korvtest::Frame(WithNames(kReply, nodes_, kNodes) + '\0')});
+    const Json::Value request = korvtest::ParseJson(R"({"resource":["all"]})");
 
     Transmitor transmitor("nas");
     ASSERT_EQ(transmitor.Transmit(request), 0);
@@ -152,21 +129,6 @@ TEST_F(WholeRoadTest, CollectorReplyBecomesTheNamedResult)
     ASSERT_TRUE(collector.WaitForConnections(1));
     EXPECT_EQ(collector.Requests().at(0),
               korvtest::Frame(std::string("{\"resource\":[\"all\"]}\n") + '\0'));
-    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
-    EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
-}
-
-// The moving assembly gives what the copying one gives, messages included.
-TEST_F(WholeRoadTest, MovingAssemblyMatchesTheCopyingOne)
-{
-    const Json::Value reply = korvtest::ParseJson(WithNames(kReply, nodes_, kNodes));
-    Json::Value request(Json::objectValue);
-    request["resource"].append("all");
-    Json::Value copied(Json::objectValue), moved(Json::objectValue), taken = reply;
-    ASSERT_TRUE(SNMPParseReplyData(request, reply, copied));
-    ASSERT_TRUE(SNMPParseReplyData(request, std::move(taken), moved));
-    EXPECT_EQ(korvtest::JsonText(moved), korvtest::Canonical(WithNames(kExpected, nodes_, kNodes)));
-    EXPECT_TRUE(moved == copied) << "member types differ";
     EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
     EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
 }

@@ -10,12 +10,14 @@
 #include <algorithm>
 #include <cerrno>
 #include <cmath>
-#include <cstring>
+#include <filesystem>
+#include <iterator>
 #include <random>
 #include <sstream>
 
 #include <json/value.h>
 
+#include "collector_process.h"
 #include "protocol/collector_protocol.h"
 
 namespace korvtest {
@@ -28,26 +30,12 @@ constexpr int kPollSliceMs = 10;
 
 enum class Kind { kIdle, kSlow, kGarbage };
 
-sockaddr_un Address(const std::string &path)
-{
-    sockaddr_un address;
-    std::memset(&address, 0, sizeof address);
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
-    return address;
-}
-
 // A non-blocking connection, or -1 (the backlog is full, or no listener).
 int ConnectNow(const sockaddr_un &address)
 {
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0);
-    if (fd < 0)
-        return -1;
-    if (connect(fd, reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0) {
-        close(fd);
-        return -1;
-    }
-    return fd;
+    korvproto::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+    bool connected = fd.Valid() && connect(fd.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) == 0;
+    return connected ? fd.Release() : -1;
 }
 
 std::string RequestFrame()
@@ -69,24 +57,16 @@ struct ClientCrowd::Client {
 ClientCrowd::ClientCrowd(std::string socketPath, CrowdSize size, bool reconnect)
     : path_(std::move(socketPath)), reconnect_(reconnect)
 {
-    const sockaddr_un address = Address(path_);
+    const sockaddr_un address = SocketAddress(path_);
     Clock::time_point start = Clock::now();
     std::mt19937 phases(7);
     std::uniform_int_distribution<int> phaseMs(0, static_cast<int>(kCrowdTick.count()) - 1);
-    auto add = [&](Kind kind, size_t count) {
+    for (auto [kind, count] : {std::pair(Kind::kIdle, size.idle), {Kind::kSlow, size.slow}, {Kind::kGarbage, size.garbage}}) {
         for (size_t i = 0; i < count; ++i) {
-            Client client;
-            client.kind = kind;
-            client.nextSend = start + std::chrono::milliseconds(phaseMs(phases));
-            client.fd = ConnectNow(address);
-            if (client.fd >= 0)
-                ++connected_;
-            clients_.push_back(client);
+            clients_.push_back({kind, ConnectNow(address), 0, start + std::chrono::milliseconds(phaseMs(phases))});
+            connected_ += clients_.back().fd >= 0 ? 1 : 0;
         }
-    };
-    add(Kind::kIdle, size.idle);
-    add(Kind::kSlow, size.slow);
-    add(Kind::kGarbage, size.garbage);
+    }
     driver_ = std::thread([this] { Drive(); });
 }
 
@@ -94,29 +74,25 @@ ClientCrowd::~ClientCrowd()
 {
     stop_ = true;
     driver_.join();
-    for (Client &client : clients_) {
-        if (client.fd >= 0)
-            close(client.fd);
-    }
+    for (Client &client : clients_)
+        close(client.fd);  // -1 for those closed already: harmless
 }
 
 void ClientCrowd::Drive()
 {
-    const sockaddr_un address = Address(path_);
+    const sockaddr_un address = SocketAddress(path_);
     const std::string request = RequestFrame();
     std::mt19937 random(11);
     std::uniform_int_distribution<int> byte(0, 255);
     std::uniform_int_distribution<size_t> chunk(1, kMaxGarbageChunk);
-    std::vector<pollfd> watched;
-    std::vector<size_t> owners;
+    std::vector<pollfd> watched(clients_.size());  // one per client; fd -1 when it has no connection
     char sink[4096];
 
     while (!stop_) {
         Clock::time_point now = Clock::now();
-        watched.clear();
-        owners.clear();
         for (size_t i = 0; i < clients_.size(); ++i) {
             Client &client = clients_[i];
+            watched[i] = {-1, POLLIN, 0};
             bool due = now >= client.nextSend;
             if (due)
                 client.nextSend += kCrowdTick * ((now - client.nextSend) / kCrowdTick + 1);
@@ -138,8 +114,7 @@ void ClientCrowd::Drive()
                     garbage[b] = static_cast<char>(byte(random));
                 (void)send(client.fd, garbage, length, MSG_NOSIGNAL);
             }
-            watched.push_back({client.fd, POLLIN, 0});
-            owners.push_back(i);
+            watched[i].fd = client.fd;
         }
 
         if (poll(watched.data(), watched.size(), kPollSliceMs) <= 0)
@@ -147,7 +122,7 @@ void ClientCrowd::Drive()
         for (size_t w = 0; w < watched.size(); ++w) {
             if (watched[w].revents == 0)
                 continue;
-            Client &client = clients_[owners[w]];
+            Client &client = clients_[w];
             ssize_t got = read(client.fd, sink, sizeof sink);
             if (got > 0 || (got < 0 && (errno == EAGAIN || errno == EINTR)))
                 continue;  // a reply to garbage; the close follows
@@ -162,53 +137,38 @@ void ClientCrowd::Drive()
 std::chrono::microseconds TimedProbe(const std::string &socketPath,
                                      std::chrono::milliseconds limit)
 {
-    using std::chrono::microseconds;
-    const microseconds failed(-1);
-    const sockaddr_un address = Address(socketPath);
+    const sockaddr_un address = SocketAddress(socketPath);
     const std::string request = RequestFrame();
     Clock::time_point start = Clock::now();
-    Clock::time_point giveUp = start + limit;
-    auto remainingMs = [&] {
-        auto left = std::chrono::ceil<std::chrono::milliseconds>(giveUp - Clock::now()).count();
-        return static_cast<int>(std::max<decltype(left)>(left, 0));
-    };
-
     int fd = ConnectNow(address);
-    while (fd < 0 && Clock::now() < giveUp) {  // the backlog is full: try again
+    while (fd < 0 && Clock::now() - start < limit) {  // the backlog is full: try again
         poll(nullptr, 0, 1);
         fd = ConnectNow(address);
     }
-    if (fd < 0)
-        return failed;
-    size_t sent = 0;
+    // A fresh connection's buffer takes the whole small request at once.
+    bool sent = fd >= 0 && send(fd, request.data(), request.size(), MSG_NOSIGNAL) ==
+                               static_cast<ssize_t>(request.size());
     std::string reply;
-    bool closed = false;
-    while (!closed && Clock::now() < giveUp) {
-        pollfd ready = {fd, static_cast<short>(sent < request.size() ? POLLOUT : POLLIN), 0};
-        if (poll(&ready, 1, remainingMs()) <= 0)
+    ssize_t got = sent ? 1 : -1;
+    while (got != 0 && sent && Clock::now() - start < limit) {
+        pollfd ready = {fd, POLLIN, 0};
+        auto left = std::chrono::ceil<std::chrono::milliseconds>(limit - (Clock::now() - start));
+        if (poll(&ready, 1, static_cast<int>(std::max<long>(left.count(), 0))) <= 0)
             continue;
-        if (sent < request.size()) {
-            ssize_t put = send(fd, request.data() + sent, request.size() - sent, MSG_NOSIGNAL);
-            if (put < 0 && errno != EAGAIN)
-                break;
-            sent += static_cast<size_t>(std::max<ssize_t>(put, 0));
-            continue;
-        }
         char buffer[65536];
-        ssize_t got = read(fd, buffer, sizeof buffer);
+        got = read(fd, buffer, sizeof buffer);
         if (got > 0)
             reply.append(buffer, static_cast<size_t>(got));
-        else if (got == 0 || errno != EAGAIN)
-            closed = true;
+        sent = got >= 0 || errno == EAGAIN;
     }
-    close(fd);
-    auto took = std::chrono::duration_cast<microseconds>(Clock::now() - start);
+    if (fd >= 0)
+        close(fd);
+    auto took = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - start);
     const size_t prefix = korvproto::kFramePrefixBytes;
-    if (!closed || reply.size() < prefix)
-        return failed;
-    bool whole = korvproto::DecodeFramePrefix(reply.data()) == reply.size() - prefix &&
+    bool whole = got == 0 && reply.size() >= prefix &&
+                 korvproto::DecodeFramePrefix(reply.data()) == reply.size() - prefix &&
                  reply.compare(prefix, 8, "{\"data\":") == 0;
-    return whole ? took : failed;
+    return whole ? took : std::chrono::microseconds(-1);
 }
 
 std::chrono::microseconds Percentile(std::vector<std::chrono::microseconds> samples, double p)
@@ -222,16 +182,9 @@ std::chrono::microseconds Percentile(std::vector<std::chrono::microseconds> samp
 
 size_t OpenDescriptorCount(pid_t pid)
 {
-    std::string dir = "/proc/" + std::to_string(pid) + "/fd";
-    size_t count = 0;
-    if (DIR *entries = opendir(dir.c_str())) {
-        while (dirent *entry = readdir(entries)) {
-            if (entry->d_name[0] != '.')
-                ++count;
-        }
-        closedir(entries);
-    }
-    return count;
+    std::error_code gone;  // the process has exited: none
+    std::filesystem::directory_iterator fds("/proc/" + std::to_string(pid) + "/fd", gone);
+    return static_cast<size_t>(std::distance(fds, std::filesystem::directory_iterator()));
 }
 
 }  // namespace korvtest

@@ -5,7 +5,6 @@
 #include <signal.h>
 #include <spawn.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -19,23 +18,28 @@
 extern char **environ;
 
 namespace korvtest {
-namespace {
 
 using Clock = std::chrono::steady_clock;
 constexpr auto kRetry = std::chrono::milliseconds(10);
 
-}  // namespace
+bool Eventually(const std::function<bool()> &condition)
+{
+    for (Clock::time_point giveUp = Clock::now() + kProcessWait; Clock::now() < giveUp;
+         std::this_thread::sleep_for(kRetry)) {
+        if (condition())
+            return true;
+    }
+    return condition();
+}
 
 CollectorProcess::CollectorProcess(const std::string &program,
                                    const std::vector<std::string> &args, std::string logPath,
                                    int inheritedFd, int inheritedAs)
     : logPath_(std::move(logPath))
 {
-    std::vector<std::string> words = {program};
-    words.insert(words.end(), args.begin(), args.end());
-    std::vector<char *> argv;
-    for (std::string &word : words)
-        argv.push_back(word.data());
+    std::vector<char *> argv = {const_cast<char *>(program.c_str())};
+    for (const std::string &arg : args)
+        argv.push_back(const_cast<char *>(arg.c_str()));
     argv.push_back(nullptr);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
@@ -51,47 +55,36 @@ CollectorProcess::CollectorProcess(const std::string &program,
 
 CollectorProcess::~CollectorProcess()
 {
-    if (pid_ > 0) {
-        kill(pid_, SIGKILL);
+    if (pid_ > 0 && kill(pid_, SIGKILL) == 0)
         waitpid(pid_, nullptr, 0);
-    }
     unlink(logPath_.c_str());
 }
 
-std::string CollectorProcess::Log() const
-{
-    return ReadWholeFile(logPath_);
-}
+std::string CollectorProcess::Log() const { return ReadWholeFile(logPath_); }
 
 int CollectorProcess::WaitForExit()
 {
-    Clock::time_point giveUp = Clock::now() + kProcessWait;
-    while (pid_ > 0 && Clock::now() < giveUp) {
-        int status = 0;
-        if (waitpid(pid_, &status, WNOHANG) == pid_) {
-            pid_ = -1;
-            return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-        }
-        std::this_thread::sleep_for(kRetry);
-    }
-    return -1;
+    int status = 0;
+    if (pid_ <= 0 || !Eventually([&] { return waitpid(pid_, &status, WNOHANG) == pid_; }))
+        return -1;
+    pid_ = -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
 }
 
-int CollectorProcess::Stop(int signal)
+int CollectorProcess::Stop(int signal) { return pid_ > 0 && kill(pid_, signal) == 0 ? WaitForExit() : -1; }
+
+sockaddr_un SocketAddress(const std::string &path)
 {
-    if (pid_ <= 0)
-        return -1;
-    kill(pid_, signal);
-    return WaitForExit();
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
+    return address;
 }
 
 korvproto::UniqueFd ConnectTo(const std::string &path)
 {
     korvproto::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_un address;
-    std::memset(&address, 0, sizeof address);
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
+    sockaddr_un address = SocketAddress(path);
     if (fd.Valid() && connect(fd.Get(), reinterpret_cast<sockaddr *>(&address), sizeof address) == 0)
         return fd;
     return korvproto::UniqueFd();
@@ -99,48 +92,34 @@ korvproto::UniqueFd ConnectTo(const std::string &path)
 
 bool WaitUntilConnectable(const std::string &path)
 {
-    Clock::time_point giveUp = Clock::now() + kProcessWait;
-    while (Clock::now() < giveUp) {
-        if (ConnectTo(path).Valid())
-            return true;
-        std::this_thread::sleep_for(kRetry);
-    }
-    return false;
+    return Eventually([&] { return ConnectTo(path).Valid(); });
 }
 
 std::string ExchangeWith(const std::string &path, const std::string &frame)
 {
     korvproto::UniqueFd connection = ConnectTo(path);
-    if (!connection.Valid())
+    if (!connection.Valid() ||
+        send(connection.Get(), frame.data(), frame.size(), MSG_NOSIGNAL) != static_cast<ssize_t>(frame.size()))
         return "";
-    const int fd = connection.Get();
     std::string reply;
-    bool closed = false;
-    if (send(fd, frame.data(), frame.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(frame.size())) {
-        Clock::time_point giveUp = Clock::now() + kProcessWait;
-        char buffer[65536];
-        while (!closed && Clock::now() < giveUp) {
-            pollfd readable = {fd, POLLIN, 0};
-            if (poll(&readable, 1, static_cast<int>(kRetry.count())) <= 0)
-                continue;
-            ssize_t got = read(fd, buffer, sizeof buffer);
-            closed = got <= 0;
-            if (got > 0)
-                reply.append(buffer, static_cast<size_t>(got));
-        }
-    }
+    char buffer[65536];
+    ssize_t got = 1;
+    pollfd readable = {connection.Get(), POLLIN, 0};
+    const bool closed = Eventually([&] {  // read all there is, until the collector closes
+        while (got > 0 && poll(&readable, 1, 0) > 0 && (got = read(connection.Get(), buffer, sizeof buffer)) > 0)
+            reply.append(buffer, static_cast<size_t>(got));
+        return got <= 0;
+    });
     const size_t prefix = korvproto::kFramePrefixBytes;
-    if (!closed || reply.size() < prefix ||
-        korvproto::DecodeFramePrefix(reply.data()) != reply.size() - prefix)
+    if (!closed || reply.size() < prefix || korvproto::DecodeFramePrefix(reply.data()) != reply.size() - prefix)
         return "";
     return reply.substr(prefix);
 }
 
 std::string ReadWholeFile(const std::string &path)
 {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream text;
-    text << in.rdbuf();
+    std::ostringstream text;
+    text << std::ifstream(path, std::ios::binary).rdbuf();
     return text.str();
 }
 

@@ -4,8 +4,10 @@
 #define KORVTEST_COLLECTOR_PROCESS_H
 
 #include <sys/types.h>
+#include <sys/un.h>
 
 #include <chrono>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -14,6 +16,9 @@
 namespace korvtest {
 
 inline constexpr std::chrono::seconds kProcessWait{10};
+
+// Whether `condition` holds within kProcessWait, polled every few milliseconds.
+bool Eventually(const std::function<bool()> &condition);
 
 class CollectorProcess {
 public:
@@ -31,13 +36,16 @@ public:
     std::string Log() const;
     // The exit status (128 + signal when killed), or -1 when it did not exit within kProcessWait.
     int WaitForExit();
-    // Sends `signal`, then waits for the exit; kills it when it does not go.
+    // Sends `signal`, then waits for the exit as WaitForExit() does.
     int Stop(int signal);
 
 private:
     std::string logPath_;
     pid_t pid_ = -1;
 };
+
+// The address of the UNIX socket `path` (cut to fit).
+sockaddr_un SocketAddress(const std::string &path);
 
 // A connection to the UNIX socket `path`; not Valid() when nobody accepts it.
 korvproto::UniqueFd ConnectTo(const std::string &path);

@@ -3,7 +3,6 @@
 #include "connect_redirect.h"
 #include "protocol/collector_protocol.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -14,83 +13,69 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
+#include <iterator>
 
 namespace korvtest {
 namespace {
 
-constexpr char kPrivateDirectoryPattern[] = "/tmp/korvtest-XXXXXX";
-constexpr char kPrivateSocketName[] = "/korvsnmpcd.sock";
 constexpr int kPeerWaitMs = 5000;  // a client that stalls longer has failed its test anyway
 
-[[noreturn]] void Die(const char *what)
+// Ends the test program when the harness itself cannot work.
+void Require(bool ok, const char *what)
 {
-    std::perror(what);
-    std::abort();
+    if (!ok) {
+        std::perror(what);
+        std::abort();
+    }
 }
 
-// Waits for `fd` to become readable, or for the stop pipe. False on stop or time-out.
-bool WaitReadable(int fd, int stopFd)
+// Waits for `fd` to become readable, or for the stop pipe. False on stop,
+// error or time-out (`timeoutMs`, -1: none).
+bool WaitReadable(int fd, int stopFd, int timeoutMs = kPeerWaitMs)
 {
     pollfd fds[2] = {{fd, POLLIN, 0}, {stopFd, POLLIN, 0}};
-    return poll(fds, 2, kPeerWaitMs) > 0 && fds[1].revents == 0;
+    return poll(fds, 2, timeoutMs) > 0 && fds[1].revents == 0;
 }
 
 // Reads exactly `count` bytes, appending them to `into`; false on EOF, error or stall.
 bool ReadExactly(int fd, int stopFd, size_t count, std::string &into)
 {
     char buffer[4096];
-    while (count > 0) {
-        if (!WaitReadable(fd, stopFd))
-            return false;
-        ssize_t got = read(fd, buffer, std::min(count, sizeof buffer));
-        if (got <= 0)
-            return false;
+    ssize_t got = 0;
+    while (count > 0 && WaitReadable(fd, stopFd) &&
+           (got = read(fd, buffer, std::min(count, sizeof buffer))) > 0) {
         into.append(buffer, static_cast<size_t>(got));
         count -= static_cast<size_t>(got);
     }
-    return true;
+    return count == 0;
 }
 
 std::string gPrivateDirectory;
 
-void RemovePrivateDirectory()
-{
-    unlink(PrivateCollectorPath().c_str());
-    rmdir(gPrivateDirectory.c_str());
-}
-
-std::string MakePrivatePath()
-{
-    char directory[] = "/tmp/korvtest-XXXXXX";
-    static_assert(sizeof directory == sizeof kPrivateDirectoryPattern);
-    if (mkdtemp(directory) == nullptr)
-        Die("making the private collector directory");
-    gPrivateDirectory = directory;
-    std::string path = gPrivateDirectory + kPrivateSocketName;
-    if (setenv(KORVTEST_COLLECTOR_SOCKET_VARIABLE, path.c_str(), 1) != 0)
-        Die("setting " KORVTEST_COLLECTOR_SOCKET_VARIABLE);
-    return path;
-}
-
-// Set up before any test runs, so that no connect() ever reaches the real path.
+// Set up before any test runs, so that no connect() ever reaches the real
+// path; the directory goes at exit.
 const bool gRedirected = [] {
     PrivateCollectorPath();
-    return std::atexit(RemovePrivateDirectory) == 0;
+    return std::atexit([] {
+        unlink(PrivateCollectorPath().c_str());
+        rmdir(gPrivateDirectory.c_str());
+    }) == 0;
 }();
-
-std::string ShellQuoted(const std::string &word)
-{
-    std::string quoted = "'";
-    for (char c : word)
-        quoted += c == '\'' ? std::string("'\\''") : std::string(1, c);
-    return quoted + "'";
-}
 
 }  // namespace
 
 const std::string &PrivateCollectorPath()
 {
-    static const std::string path = MakePrivatePath();
+    static const std::string path = [] {
+        char directory[] = "/tmp/korvtest-XXXXXX";
+        Require(mkdtemp(directory) != nullptr, "making the private collector directory");
+        gPrivateDirectory = directory;
+        const std::string socket = gPrivateDirectory + "/korvsnmpcd.sock";
+        Require(setenv(KORVTEST_COLLECTOR_SOCKET_VARIABLE, socket.c_str(), 1) == 0,
+                "setting " KORVTEST_COLLECTOR_SOCKET_VARIABLE);
+        return socket;
+    }();
     return path;
 }
 
@@ -108,8 +93,11 @@ std::string RedirectedChildPrefix()
 {
     std::string prefix;
     for (const std::string &variable : RedirectedChildVariables()) {
-        size_t equals = variable.find('=');
-        prefix += variable.substr(0, equals + 1) + ShellQuoted(variable.substr(equals + 1)) + " ";
+        const size_t equals = variable.find('=');
+        prefix += variable.substr(0, equals + 1) + "'";  // the value single-quoted
+        for (char c : variable.substr(equals + 1))
+            prefix += c == '\'' ? std::string("'\\''") : std::string(1, c);
+        prefix += "' ";
     }
     return prefix;
 }
@@ -127,25 +115,19 @@ TestCollector::TestCollector()
 {
     unlink(PrivateCollectorPath().c_str());
     listenFd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (listenFd_ < 0)
-        Die("test collector socket");
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
-    if (PrivateCollectorPath().size() >= sizeof address.sun_path)
-        Die("the private collector path is too long");
-    std::strcpy(address.sun_path, PrivateCollectorPath().c_str());
-    if (bind(listenFd_, reinterpret_cast<sockaddr *>(&address), sizeof address) != 0 ||
-        listen(listenFd_, 16) != 0)
-        Die("test collector bind/listen");
-    if (pipe2(stopPipe_, O_CLOEXEC) != 0)
-        Die("test collector pipe");
+    std::strncpy(address.sun_path, PrivateCollectorPath().c_str(), sizeof address.sun_path - 1);
+    const auto *named = reinterpret_cast<sockaddr *>(&address);
+    Require(listenFd_ >= 0 && bind(listenFd_, named, sizeof address) == 0 &&
+                listen(listenFd_, 16) == 0 && pipe2(stopPipe_, O_CLOEXEC) == 0,
+            "starting the test collector");
     server_ = std::thread(&TestCollector::Serve, this);
 }
 
 TestCollector::~TestCollector()
 {
-    if (write(stopPipe_[1], "x", 1) != 1)
-        Die("stopping the test collector");
+    Require(write(stopPipe_[1], "x", 1) == 1, "stopping the test collector");
     server_.join();
     close(listenFd_);
     close(stopPipe_[0]);
@@ -174,64 +156,41 @@ bool TestCollector::WaitForConnections(size_t count) const
 
 void TestCollector::Serve()
 {
-    for (;;) {
-        pollfd fds[2] = {{listenFd_, POLLIN, 0}, {stopPipe_[0], POLLIN, 0}};
-        if (poll(fds, 2, -1) < 0 || fds[1].revents != 0)
-            return;
-        int connection = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
+    while (WaitReadable(listenFd_, stopPipe_[0], -1)) {
+        const int connection = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
         if (connection < 0)
             continue;
-        Answer answer;
-        {
-            std::lock_guard<std::mutex> lock(mutex_);
-            if (!script_.empty()) {
-                answer = std::move(script_.front());
-                script_.pop_front();
-            }
-        }
-        Handle(connection, answer);
-    }
-}
-
-void TestCollector::Handle(int connection, const Answer &answer)
-{
-    std::string received;
-    if (answer.readRequest) {
-        std::string prefix;
-        if (ReadExactly(connection, stopPipe_[0], korvproto::kFramePrefixBytes, prefix)) {
-            received = prefix;
-            ReadExactly(connection, stopPipe_[0], korvproto::DecodeFramePrefix(prefix.data()),
-                        received);
-        } else {
-            received = prefix;
-        }
-        if (!answer.bytes.empty() &&
-            send(connection, answer.bytes.data(), answer.bytes.size(), MSG_NOSIGNAL) < 0)
-            std::perror("test collector send");
-        if (!answer.hangUp) {
+        std::unique_lock<std::mutex> lock(mutex_);
+        const Answer answer = script_.empty() ? Answer{} : std::move(script_.front());
+        if (!script_.empty())
+            script_.pop_front();
+        lock.unlock();
+        std::string received;
+        if (answer.readRequest) {
+            if (ReadExactly(connection, stopPipe_[0], korvproto::kFramePrefixBytes, received))
+                ReadExactly(connection, stopPipe_[0],
+                            korvproto::DecodeFramePrefix(received.data()), received);
+            if (!answer.bytes.empty() &&
+                send(connection, answer.bytes.data(), answer.bytes.size(), MSG_NOSIGNAL) < 0)
+                std::perror("test collector send");
             char ignored[256];
-            while (WaitReadable(connection, stopPipe_[0]) &&
+            while (!answer.hangUp && WaitReadable(connection, stopPipe_[0]) &&
                    read(connection, ignored, sizeof ignored) > 0) {
             }
         }
+        close(connection);
+        lock.lock();
+        requests_.push_back(std::move(received));
+        changed_.notify_all();
     }
-    close(connection);
-    std::lock_guard<std::mutex> lock(mutex_);
-    requests_.push_back(std::move(received));
-    changed_.notify_all();
 }
 
 int OpenDescriptorCount()
 {
-    int count = 0;
-    DIR *directory = opendir("/proc/self/fd");
-    if (directory == nullptr)
-        return -1;
-    while (dirent *entry = readdir(directory))
-        if (entry->d_name[0] != '.')
-            ++count;
-    closedir(directory);
-    return count - 1;  // the directory's own descriptor
+    std::error_code error;
+    std::filesystem::directory_iterator entries("/proc/self/fd", error);
+    // Less the iterator's own descriptor.
+    return error ? -1 : static_cast<int>(std::distance(begin(entries), end(entries))) - 1;
 }
 
 }  // namespace korvtest

@@ -74,8 +74,7 @@ public:
     bool WaitForConnections(size_t count) const;
 
 private:
-    void Serve();
-    void Handle(int connection, const Answer &answer);
+    void Serve();  // answers each connection with the next scripted Answer
 
     int listenFd_ = -1;
     int stopPipe_[2] = {-1, -1};
