@@ -50,7 +50,6 @@
 
 #include <benchmark/benchmark.h>
 #include <json/reader.h>
-#include <json/writer.h>
 
 #include "appliance.h"
 #include "korv_standin.h"
@@ -399,7 +398,7 @@ std::string DescribeAppliance(const SpaceNodes &nodes)
     korvexample::Appliance appliance = korvexample::MakeAppliance(korvexample::LargeAppliance(), devices);
     korvstandin::Reset();
     korvstandin::Host() = std::move(appliance.host);
-    return Json::FastWriter().write(appliance.reply);
+    return korvproto::CompactJson(appliance.reply);
 }
 
 // Serves the framed reply to every connection, on its own thread. Everything
