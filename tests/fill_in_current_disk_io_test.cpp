@@ -55,11 +55,7 @@ using DiskIOTest = korvtest::PlatformTest;
 
 TEST_F(DiskIOTest, ExpansionUnitDiskNamesItsFirstPoweredListingUnit)
 {
-    const struct {
-        std::optional<std::string> model;
-        bool powered;
-        const char *name;
-    } cases[] = {
+    const struct { std::optional<std::string> model; bool powered; const char *name; } cases[] = {
         {"Korvel-X5", true, "sdc=Disk 3 (X5-2)/ebox"},
         {"X5", true, "sdc=Disk 3 (X5-2)/ebox"},
         {"Korvel-X5", false, "sdc=Disk 3 (Expansion Unit)/ebox"},

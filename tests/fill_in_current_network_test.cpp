@@ -121,10 +121,7 @@ TEST_F(NetworkTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
     const auto number = [](const char *device, const char *member) {
         return std::string("Network device [") + device + "]: \"" + member + "\" is not an unsigned 32-bit number";
     };
-    const struct {
-        const char *network;
-        std::string message;
-    } cases[] = {
+    const struct { const char *network; std::string message; } cases[] = {
         {R"({"device": "eth0"})", "ReplyNetwork is not array"},
         {R"([{"device": "eth0"}, 3])", "Network element 1 is not an object"},
         {R"([["eth0"]])", "Network element 0 is not an object"},

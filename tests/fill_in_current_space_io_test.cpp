@@ -51,9 +51,7 @@ using SpaceIOTest = korvtest::PlatformTest;
 TEST_F(SpaceIOTest, UnreadableInputFailsUntouchedAndEmptyInputGivesNoVolumes)
 {
     korvstandin::Host().spaces = {{"/dev/none", "vol"}};
-    const struct {
-        const char *spaceIO, *message;
-    } cases[] = {
+    const struct { const char *spaceIO, *message; } cases[] = {
         {R"({"device": "total"})", "SpaceIO is not array."},
         {R"([{"device": "total"}, 3])", "SpaceIO element 1 is not an object"},
         {R"([{"device": "total"}, {"device": 7}])", R"(SpaceIO element 1: "device" is not a string)"},

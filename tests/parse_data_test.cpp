@@ -117,10 +117,7 @@ TEST_F(ParseDataTest, ValuesOfTheWrongTypeFailWithAMessage)
     };
     Json::Value dataArray = FullReply();
     dataArray["data"] = array;
-    const struct {
-        Json::Value request, reply, result;
-        std::string message;
-    } cases[] = {
+    const struct { Json::Value request, reply, result; std::string message; } cases[] = {
         {array, FullReply(), Json::Value(), types("6, 7, 0")},
         {Json::Value(), Json::Value("reply"), Json::Value(), types("0, 4, 0")},
         {Json::Value(), dataArray, Json::Value(), "Reply data is not a JSON object (type 6)"},
