@@ -25,8 +25,7 @@
 
 namespace {
 
-using korvstandin::Fault;
-using korvstandin::Op;
+using korvstandin::Fault, korvstandin::Op;
 
 enum class Result { True, False, Threw };
 
@@ -72,7 +71,8 @@ Outcome FailedCallOutcome(Op op, const std::string &entry)
                                                ? "fill_in_current_disk_io Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE"
                                                : "fill_in_current_disk_io KORVExternalDevEnum: Error KORVUSBDevEnum"}};
     case Op::KORVSpaceInfoEnum:
-        return {Result::False, {"cpu", "memory", "network", "disk", "space=null"}, {"fill_in_current_space_io Failed to enum space info"}};
+        return {Result::False, {"cpu", "memory", "network", "disk", "space=null"},
+                {"fill_in_current_space_io Failed to enum space info"}};
     case Op::KLIBCSzHashSetValue:  // the stand-in's last error: code, "standin" and the operation's index
         return {Result::True, kAllMembers, {"fill_in_current_disk_io KLIBCSzHashSetValue failed[0x0D01 standin:4]"}};
     case Op::KLIBCFileGetSectionValue: {  // "(path, volume, key, ...)"
@@ -94,11 +94,11 @@ struct FaultSweep : korvtest::PlatformTest {
     void SetUp() override
     {
         PlatformTest::SetUp();
-        const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
-        if (std::string whyNot; !nodes_.Make(static_cast<size_t>(shape.spaces), whyNot)) GTEST_SKIP() << whyNot;
+        const size_t spaces = static_cast<size_t>(korvexample::SmallAppliance().spaces);
+        if (std::string whyNot; !nodes_.Make(spaces, whyNot)) GTEST_SKIP() << whyNot;
         std::vector<korvexample::SpaceDevice> devices;
-        for (size_t i = 0; i < static_cast<size_t>(shape.spaces); ++i) devices.push_back({nodes_.Node(i), nodes_.Name(i)});
-        appliance_ = korvexample::MakeAppliance(shape, devices);
+        for (size_t i = 0; i < spaces; ++i) devices.push_back({nodes_.Node(i), nodes_.Name(i)});
+        appliance_ = korvexample::MakeAppliance(korvexample::SmallAppliance(), devices);
         Describe();
         korvstandin::SetJournal(true);
         baseline_ = Run();
@@ -118,14 +118,15 @@ struct FaultSweep : korvtest::PlatformTest {
             if (seam != nullptr) seam->emplace(args...);
             outcome.result = SNMPParseReplyData(Json::Value(Json::objectValue), appliance_.reply, result)
                                  ? Result::True : Result::False;
-        } catch (const std::bad_alloc &) {
-            outcome.result = Result::Threw;
-        }
+        } catch (const std::bad_alloc &) { outcome.result = Result::Threw; }
         if (seam != nullptr) (*seam)->Stop();
-        for (const std::string &member : result.getMemberNames()) outcome.members.insert(member + (result[member].isNull() ? "=null" : ""));
+        for (const std::string &member : result.getMemberNames())
+            outcome.members.insert(member + (result[member].isNull() ? "=null" : ""));
         outcome.value = result;
-        for (const korvtest::LogEntry &e : korvtest::LoggedMessages())  // "<unit>:<line> <text>" as "<unit> <text>"
-            outcome.messages.push_back(e.text.substr(0, e.text.find(':')) + e.text.substr(e.text.find(' ', e.text.find(':'))));
+        for (const korvtest::LogEntry &entry : korvtest::LoggedMessages()) {  // "<unit>:<line> <text>" as "<unit> <text>"
+            const size_t colon = entry.text.find(':');
+            outcome.messages.push_back(entry.text.substr(0, colon) + entry.text.substr(entry.text.find(' ', colon)));
+        }
         return outcome;
     }
 
@@ -142,15 +143,16 @@ TEST_F(FaultSweep, EveryPlatformCallFailedInTurn)
 {
     ASSERT_EQ(baseline_, kClean);
     int cases = 0;
-    for (int index = 0; index < static_cast<int>(Op::Count_); ++index)
-        for (int call = 1; call <= static_cast<int>(journal_[korvstandin::OpName(Op(index))].size()); ++call, ++cases) {
-            const Op op = static_cast<Op>(index);
+    for (int index = 0; index < static_cast<int>(Op::Count_); ++index) {
+        const Op op = static_cast<Op>(index);
+        for (int call = 1; call <= static_cast<int>(journal_[korvstandin::OpName(op)].size()); ++call, ++cases) {
             SCOPED_TRACE(Entry(op, call) + " failing, call " + std::to_string(call));
             Describe();
             korvstandin::SetFault(op, Fault::Fail, korvstandin::kOutOfMemoryError, korvstandin::Calls::Only(call));
             EXPECT_EQ(Run(), FailedCallOutcome(op, Entry(op, call)));
             EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
         }
+    }
     for (Op op : {Op::DiskInfoEnum, Op::KORVEBoxInfoEnum, Op::KORVSpaceInfoEnum, Op::KORVFlashCacheConfigGet}) {
         SCOPED_TRACE(std::string(korvstandin::OpName(op)) + " failing with a list");
         Describe();
@@ -209,11 +211,14 @@ using Host = korvstandin::HostDescription;
 // Each malformed answer: what it gives, and (where not null) a check of the result.
 const struct { const char *name; void (*arrange)(Host &host, Json::Value &data); Outcome expected;
                void (*check)(const Json::Value &result); } kMalformed[] = {
-    {"NameFillsItsFieldWithoutNul", [](Host &host, Json::Value &data) { host.unterminatedFields = true; AddTraffic(host, data, "abcdefghijklmnop"); },
-     kClean, [](const Json::Value &r) { EXPECT_THAT(korvtest::JsonText(r["network"]), ::testing::HasSubstr("abcdefghijklmnop")); }},
+    {"NameFillsItsFieldWithoutNul",
+     [](Host &host, Json::Value &data) { host.unterminatedFields = true; AddTraffic(host, data, "abcdefghijklmnop"); },
+     kClean, [](const Json::Value &r) {
+         EXPECT_THAT(korvtest::JsonText(r["network"]), ::testing::HasSubstr(R"("abcdefghijklmnop")")); }},
     {"MoreThan32Interfaces", [](Host &host, Json::Value &data) {
          for (int i = 0; i < 40; ++i) AddTraffic(host, data, "x" + std::to_string(100 + i));
-         host.interfaceCountClaim = static_cast<int>(host.interfaces.size()); }, kClean, [](const Json::Value &result) { EXPECT_LE(result["network"].size(), 1u + 32u + 1u + 1u); }},
+         host.interfaceCountClaim = static_cast<int>(host.interfaces.size()); },
+     kClean, [](const Json::Value &r) { EXPECT_LE(r["network"].size(), 1u + 32u + 1u + 1u); }},
     {"DeviceCountBeyondItsBlock", [](Host &host, Json::Value &) { host.usb.countClaim = 1000; }, kClean, nullptr},
     {"FlashCacheWithoutSpacePath", [](Host &h, Json::Value &) { h.flashCaches[0].spacePath.reset(); }, kClean, nullptr},
     {"FlashCacheWithoutVolumePath", [](Host &h, Json::Value &) { h.flashCaches[0].volumePath.reset(); }, kClean, nullptr},

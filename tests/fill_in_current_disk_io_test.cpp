@@ -20,7 +20,7 @@
 namespace {
 
 using korvstandin::Host, korvstandin::Op;
-using korvtest::Canonical, korvtest::Logged, korvtest::LoggedMessages, korvtest::JsonText, korvtest::ParseJson;
+using korvtest::Canonical, korvtest::JsonText, korvtest::Logged, korvtest::LoggedMessages, korvtest::ParseJson;
 using ::testing::ElementsAre, ::testing::IsEmpty;
 
 constexpr char kUnit[] = "fill_in_current_disk_io";
@@ -30,11 +30,12 @@ constexpr char kUnit[] = "fill_in_current_disk_io";
 std::vector<std::string> Names(const std::vector<std::string> &devices)
 {
     Json::Value diskIO(Json::arrayValue), out;
-    for (const std::string &device : devices) diskIO.append(Json::Value(Json::objectValue))["device"] = device;
+    for (const std::string &d : devices) diskIO.append(Json::Value(Json::objectValue))["device"] = d;
     EXPECT_TRUE(KORVSNMP::FillInCurrentDiskIO(diskIO, out));
     std::vector<std::string> names;
     for (const Json::Value &d : out["disk"])
-        names.push_back(d["device"].asString() + "=" + d["display_name"].asString() + "/" + d["type"].asString());
+        names.push_back(d["device"].asString() + "=" + d["display_name"].asString() + "/" +
+                        d["type"].asString());
     return names;
 }
 
@@ -76,7 +77,8 @@ TEST_F(DiskIOTest, InternalAndSsdCacheNamesAndDeviceKeys)
     Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"},   {2, DISK_CONTAINER_INTERNAL, 0, "md2"},
                     {12, DISK_CONTAINER_SSD_CACHE, 1, "/dev/s1"},  {12, DISK_CONTAINER_SSD_CACHE, 0, "/dev/s2"},
                     {12, DISK_CONTAINER_SSD_CACHE, -1, "/dev/s3"}, {100, DISK_CONTAINER_SSD_CACHE, 100, "/dev/s4"},
-                    {100, DISK_CONTAINER_SSD_CACHE, 1000, "/dev/s5"}, {7, DISK_CONTAINER_INTERNAL, 0, "/dev/gone", true}};
+                    {100, DISK_CONTAINER_SSD_CACHE, 1000, "/dev/s5"},
+                    {7, DISK_CONTAINER_INTERNAL, 0, "/dev/gone", true}};
     EXPECT_THAT(Names({"sda", "/dev/sda", "md2", "s1", "s2", "s3", "s4", "s5", "gone"}),
                 ElementsAre("sda=Disk 1/internal", "md2=Disk 2/internal", "s1=SSD Cache 1-12/internal",
                             "s2=SSD Cache 12/internal", "s3=SSD Cache 2/internal",
@@ -99,9 +101,9 @@ TEST_F(DiskIOTest, MissingTextsReadAsEmpty)
     Host().files.clear();
     Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}, {3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"}};
     EXPECT_THAT(Names({"sda", "sdc"}), ElementsAre("sda= 1/internal", "sdc= 3 ()/ebox"));
-    const auto missing = [](const char *k) { return Logged(LOG_ERR, kUnit, "Fail to get text [volume:" + std::string(k) + "]"); };
-    EXPECT_THAT(LoggedMessages(), ElementsAre(missing("volume_disk"), missing("volume_expansion"), missing("dedicated_ssd_cache"),
-                                              missing("volume_disk"), missing("volume_expansion"), missing("dedicated_ssd_cache")));
+    const auto m = [](std::string key) { return Logged(LOG_ERR, kUnit, "Fail to get text [volume:" + key + "]"); };
+    EXPECT_THAT(LoggedMessages(), ElementsAre(m("volume_disk"), m("volume_expansion"), m("dedicated_ssd_cache"),
+                                              m("volume_disk"), m("volume_expansion"), m("dedicated_ssd_cache")));
 }
 
 TEST_F(DiskIOTest, UnitsWithoutWrapperAreNotSearched)
@@ -150,7 +152,8 @@ TEST_F(DiskIOTest, QuillboxNamesOnlyExternalDevicesAndAFailedListEndsTheCall)
     Json::Value out;
     EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(ParseJson(R"([{"device": "sde"}])"), out));
     EXPECT_TRUE(out.isNull());
-    EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE")));
+    const char *const failedList = "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE";
+    EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, failedList)));
     EXPECT_EQ(korvstandin::CallCount(Op::KORVUSBDevEnum), listCalls + 1);
 }
 

@@ -15,9 +15,7 @@
 
 namespace {
 
-using korvstandin::LunAnswer, korvstandin::Op;
-using korvtest::ParseJson;
-using ::testing::ElementsAre;
+using korvstandin::LunAnswer, korvstandin::Op, korvtest::ParseJson, ::testing::ElementsAre;
 
 constexpr char kUnit[] = "fill_in_current_lun_io";
 
@@ -75,8 +73,7 @@ TEST_F(LunIOTest, UnusableAnswerLeavesTheUuidAsName)
 TEST_F(LunIOTest, UnreadableInputFailsUntouchedAndEmptyInputAsksNothing)
 {
     const struct { const char *lunIO; const char *message; } cases[] = {
-        {R"({"device": "u-1"})", "LunIO is not array."},
-        {R"([{"device": "u-1"}, "u-2"])", "LunIO element 1 is not an object"},
+        {R"({"device": "u-1"})", "LunIO is not array."}, {R"([{"device": "u-1"}, "u-2"])", "LunIO element 1 is not an object"},
         {R"([{"device": "u-1"}, {"device": 7}])", R"(LunIO element 1: "device" is not a string)"},
         {R"([{"device": {"uuid": "u-1"}}])", R"(LunIO element 0: "device" is not a string)"},
         {R"([{"device": null}, {"device": false}])", R"(LunIO element 1: "device" is not a string)"},
