@@ -101,7 +101,8 @@ TEST_F(DiskIOTest, MissingTextsReadAsEmpty)
     Host().files.clear();
     Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}, {3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"}};
     EXPECT_THAT(Names({"sda", "sdc"}), ElementsAre("sda= 1/internal", "sdc= 3 ()/ebox"));
-    const auto m = [](std::string key) { return Logged(LOG_ERR, kUnit, "Fail to get text [volume:" + key + "]"); };
+    const auto m = [](std::string key) {
+        return Logged(LOG_ERR, kUnit, "Fail to get text [volume:" + key + "]"); };
     EXPECT_THAT(LoggedMessages(), ElementsAre(m("volume_disk"), m("volume_expansion"), m("dedicated_ssd_cache"),
                                               m("volume_disk"), m("volume_expansion"), m("dedicated_ssd_cache")));
 }

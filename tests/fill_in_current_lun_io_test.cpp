@@ -73,7 +73,8 @@ TEST_F(LunIOTest, UnusableAnswerLeavesTheUuidAsName)
 TEST_F(LunIOTest, UnreadableInputFailsUntouchedAndEmptyInputAsksNothing)
 {
     const struct { const char *lunIO; const char *message; } cases[] = {
-        {R"({"device": "u-1"})", "LunIO is not array."}, {R"([{"device": "u-1"}, "u-2"])", "LunIO element 1 is not an object"},
+        {R"({"device": "u-1"})", "LunIO is not array."},
+        {R"([{"device": "u-1"}, "u-2"])", "LunIO element 1 is not an object"},
         {R"([{"device": "u-1"}, {"device": 7}])", R"(LunIO element 1: "device" is not a string)"},
         {R"([{"device": {"uuid": "u-1"}}])", R"(LunIO element 0: "device" is not a string)"},
         {R"([{"device": null}, {"device": false}])", R"(LunIO element 1: "device" is not a string)"},

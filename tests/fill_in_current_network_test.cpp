@@ -115,7 +115,8 @@ TEST_F(NetworkTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
     const auto number = [](std::string device, const char *member) {
         return "Network device [" + device + "]: \"" + member + "\" is not an unsigned 32-bit number"; };
     const struct { const char *network; std::string message; } cases[] = {
-        {R"({"device": "eth0"})", "ReplyNetwork is not array"}, {R"([["eth0"]])", "Network element 0 is not an object"},
+        {R"({"device": "eth0"})", "ReplyNetwork is not array"},
+        {R"([["eth0"]])", "Network element 0 is not an object"},
         {R"([{"device": "eth0"}, 3])", "Network element 1 is not an object"},
         {R"([{"device": "eth0", "rx": -1}])", number("eth0", "rx")},
         {R"([{"device": "eth0", "tx": 4294967296}])", number("eth0", "tx")},

@@ -61,7 +61,8 @@ TEST_F(SpaceIOTest, UnreadableInputFailsUntouchedAndEmptyInputGivesNoVolumes)
         SCOPED_TRACE(c.spaceIO);
         korvtest::ClearLog();
         EXPECT_EQ(Fill(Parse(c.spaceIO), false), Parse(R"({"earlier": 1})"));
-        EXPECT_THAT(korvtest::LoggedMessages(), ::testing::ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
+        EXPECT_THAT(korvtest::LoggedMessages(),
+                    ::testing::ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
     }
     korvtest::ClearLog();  // an empty section gives an empty volume list
     EXPECT_EQ(Fill(Json::Value(Json::arrayValue)), Parse(R"({"earlier": 1, "volume": []})"));

@@ -69,7 +69,8 @@ TEST_F(LiveHostTest, DisksSpacesAndLunsAreProbed)
 
 TEST_F(LiveHostTest, InterfacesWithVlansBondsAndPpp)
 {
-    for (const char *name : {"lo", "eth0", "eth1", "eth0.5", "ppp0"}) Write(std::string("sys/class/net/") + name);
+    for (const char *name : {"lo", "eth0", "eth1", "eth0.5", "ppp0"})
+        Write(std::string("sys/class/net/") + name);
     Write("sys/class/net/bond0/bonding/slaves", "eth0 eth1\n");
     Write("proc/net/vlan/config", "VLAN Dev name    | VLAN ID\nName-Type: VLAN_NAME_TYPE_RAW_PLUS_VID_NO_PAD\n"
                                   "eth0.5         | 5  | eth0\n");
@@ -82,7 +83,8 @@ TEST_F(LiveHostTest, InterfacesWithVlansBondsAndPpp)
     const auto vlan = ProbeInterface(root, "eth0.5");
     EXPECT_TRUE(vlan->role == NetRole::Vlan && vlan->vlanParent == "eth0" && vlan->vlanName == "eth0.5");
     EXPECT_EQ(ProbeInterface(root, "eth0")->role, NetRole::Plain);
-    for (const char *absent : {"eth9", "", "..", "../net/eth0"}) EXPECT_FALSE(ProbeInterface(root, absent)) << absent;
+    for (const char *absent : {"eth9", "", "..", "../net/eth0"})
+        EXPECT_FALSE(ProbeInterface(root, absent)) << absent;
     EXPECT_EQ(korvstandin::live::ProbePppLink(root), "ppp0");
 }
 
@@ -94,7 +96,8 @@ TEST_F(LiveHostTest, StringsFileWhenPresentElseShippedTexts)
     EXPECT_EQ(texts["volume_disk"] + "/" + texts["volume_expansion"] + "/" + texts["dedicated_ssd_cache"],
               "Disk/Expansion Unit/SSD Cache");
 
-    Write(korvstandin::kStringsFilePath + 1, "# web texts\n[common]\nok = \"OK\"\n[volume]\nvolume_disk=\"Laufwerk\"\n");
+    Write(korvstandin::kStringsFilePath + 1,
+          "# web texts\n[common]\nok = \"OK\"\n[volume]\nvolume_disk=\"Laufwerk\"\n");
     HostDescription present;
     korvstandin::live::ProbeStrings(root_.string(), present);
     EXPECT_EQ(present.files[korvstandin::kStringsFilePath],

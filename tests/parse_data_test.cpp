@@ -59,7 +59,8 @@ TEST_F(ParseDataTest, EverySectionIsTakenOverWithTime)
 // the call that fails.
 TEST_F(ParseDataTest, RequestSelectsTheSectionsAndTheFirstBadOneEndsTheAssembly)
 {
-    // `member`: the reply's data member to replace with `value` ("" drops it); `message`: "" when nothing is logged.
+    // `member`: the reply's data member to replace with `value` ("" drops it);
+    // `message`: "" when nothing is logged.
     const struct { const char *request, *member, *value, *message; bool succeeds; Members members; } cases[] = {
         {"{}", "", "", "", true, kEverySection}, {"null", "", "", "", true, kEverySection},
         {R"({"resource": []})", "", "", "", true, kEverySection},
@@ -99,7 +100,8 @@ TEST_F(ParseDataTest, RequestSelectsTheSectionsAndTheFirstBadOneEndsTheAssembly)
 TEST_F(ParseDataTest, ValuesOfTheWrongTypeFailWithAMessage)
 {
     const Json::Value array(Json::arrayValue);
-    const auto types = [](std::string t) { return "Request, reply and result must be JSON objects (types " + t + ")"; };
+    const auto types = [](std::string t) {
+        return "Request, reply and result must be JSON objects (types " + t + ")"; };
     Json::Value dataArray = FullReply();
     dataArray["data"] = array;
     const struct { Json::Value request, reply, result; std::string message; } cases[] = {
