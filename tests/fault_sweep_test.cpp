@@ -25,8 +25,7 @@
 
 namespace {
 
-using korvstandin::Fault;
-using korvstandin::Op;
+using korvstandin::Fault, korvstandin::Op;
 
 enum class Result { True, False, Threw };
 
@@ -43,19 +42,16 @@ std::ostream &operator<<(std::ostream &out, const Outcome &outcome)
 {
     static const char *const kResults[] = {"true", "false", "std::bad_alloc"};
     out << kResults[static_cast<int>(outcome.result)] << " {";
-    for (const std::string &member : outcome.members)
-        out << ' ' << member;
-    for (const std::string &message : outcome.messages)
-        out << " [" << message << ']';
+    for (const std::string &member : outcome.members) out << ' ' << member;
+    for (const std::string &message : outcome.messages) out << " [" << message << ']';
     return out << " }";
 }
 
 bool operator==(const Outcome &a, const Outcome &b)
-{
-    return a.result == b.result && a.members == b.members && a.messages == b.messages;
-}
+{ return a.result == b.result && a.members == b.members && a.messages == b.messages; }
 
 const std::set<std::string> kAllMembers = {"cpu", "disk", "lun", "memory", "network", "nfs", "space", "time"};
+const Outcome kClean = {Result::True, kAllMembers, {}};
 // Members present when the named fill-in fails: those before it, and its own
 // (created null, and left so except by the network section).
 const std::set<std::string> kUpToDisk = {"cpu", "memory", "network", "disk=null"};
@@ -77,8 +73,7 @@ Outcome FailedCallOutcome(Op op, const std::string &entry)
     case Op::KORVSpaceInfoEnum:
         return {Result::False, {"cpu", "memory", "network", "disk", "space=null"},
                 {"fill_in_current_space_io Failed to enum space info"}};
-    case Op::KLIBCSzHashSetValue:
-        // The stand-in's last error: code, "standin" and the operation's index.
+    case Op::KLIBCSzHashSetValue:  // the stand-in's last error: code, "standin" and the operation's index
         return {Result::True, kAllMembers, {"fill_in_current_disk_io KLIBCSzHashSetValue failed[0x0D01 standin:4]"}};
     case Op::KLIBCFileGetSectionValue: {  // "(path, volume, key, ...)"
         const std::string key = entry.substr(entry.find(", volume, ") + 10);
@@ -90,25 +85,20 @@ Outcome FailedCallOutcome(Op op, const std::string &entry)
     case Op::JsonArrayHasString:  // "all" not found: nothing is selected
         return {Result::True, {"time"}, {}};
     default:  // a failure that the road passes over silently
-        return {Result::True, kAllMembers, {}};
+        return kClean;
     }
 }
 
 
-class FaultSweep : public korvtest::PlatformTest {
-protected:
+struct FaultSweep : korvtest::PlatformTest {
     void SetUp() override
     {
         PlatformTest::SetUp();
-        const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
-        std::string whyNot;
-        if (!nodes_.Make(static_cast<size_t>(shape.spaces), whyNot))
-            GTEST_SKIP() << whyNot;
+        const size_t spaces = static_cast<size_t>(korvexample::SmallAppliance().spaces);
+        if (std::string whyNot; !nodes_.Make(spaces, whyNot)) GTEST_SKIP() << whyNot;
         std::vector<korvexample::SpaceDevice> devices;
-        for (size_t i = 0; i < static_cast<size_t>(shape.spaces); ++i)
-            devices.push_back({nodes_.Node(i), nodes_.Name(i)});
-        appliance_ = korvexample::MakeAppliance(shape, devices);
-
+        for (size_t i = 0; i < spaces; ++i) devices.push_back({nodes_.Node(i), nodes_.Name(i)});
+        appliance_ = korvexample::MakeAppliance(korvexample::SmallAppliance(), devices);
         Describe();
         korvstandin::SetJournal(true);
         baseline_ = Run();
@@ -125,15 +115,11 @@ protected:
         Outcome outcome;
         Json::Value result(Json::objectValue);
         try {
-            if (seam != nullptr)
-                seam->emplace(args...);
-            const bool ok = SNMPParseReplyData(Json::Value(Json::objectValue), appliance_.reply, result);
-            outcome.result = ok ? Result::True : Result::False;
-        } catch (const std::bad_alloc &) {
-            outcome.result = Result::Threw;
-        }
-        if (seam != nullptr)
-            (*seam)->Stop();
+            if (seam != nullptr) seam->emplace(args...);
+            outcome.result = SNMPParseReplyData(Json::Value(Json::objectValue), appliance_.reply, result)
+                                 ? Result::True : Result::False;
+        } catch (const std::bad_alloc &) { outcome.result = Result::Threw; }
+        if (seam != nullptr) (*seam)->Stop();
         for (const std::string &member : result.getMemberNames())
             outcome.members.insert(member + (result[member].isNull() ? "=null" : ""));
         outcome.value = result;
@@ -155,7 +141,7 @@ protected:
 
 TEST_F(FaultSweep, EveryPlatformCallFailedInTurn)
 {
-    ASSERT_EQ(baseline_, (Outcome{Result::True, kAllMembers, {}}));
+    ASSERT_EQ(baseline_, kClean);
     int cases = 0;
     for (int index = 0; index < static_cast<int>(Op::Count_); ++index) {
         const Op op = static_cast<Op>(index);
@@ -221,35 +207,23 @@ void AddTraffic(korvstandin::HostDescription &host, Json::Value &data, const std
 }
 
 using Host = korvstandin::HostDescription;
-const Outcome kClean = {Result::True, kAllMembers, {}};
 
 // Each malformed answer: what it gives, and (where not null) a check of the result.
-const struct {
-    const char *name;
-    void (*arrange)(Host &host, Json::Value &data);
-    Outcome expected;
-    void (*check)(const Json::Value &result);
-} kMalformed[] = {
+const struct { const char *name; void (*arrange)(Host &host, Json::Value &data); Outcome expected;
+               void (*check)(const Json::Value &result); } kMalformed[] = {
     {"NameFillsItsFieldWithoutNul",
      [](Host &host, Json::Value &data) { host.unterminatedFields = true; AddTraffic(host, data, "abcdefghijklmnop"); },
-     kClean, [](const Json::Value &result) {
-         EXPECT_THAT(korvtest::JsonText(result["network"]), ::testing::HasSubstr(R"("abcdefghijklmnop")"));
-     }},
-    {"MoreThan32Interfaces",
-     [](Host &host, Json::Value &data) {
-         for (int i = 0; i < 40; ++i)
-             AddTraffic(host, data, "x" + std::to_string(100 + i));
-         host.interfaceCountClaim = static_cast<int>(host.interfaces.size());
-     },
-     kClean, [](const Json::Value &result) { EXPECT_LE(result["network"].size(), 1u + 32u + 1u + 1u); }},
+     kClean, [](const Json::Value &r) {
+         EXPECT_THAT(korvtest::JsonText(r["network"]), ::testing::HasSubstr(R"("abcdefghijklmnop")")); }},
+    {"MoreThan32Interfaces", [](Host &host, Json::Value &data) {
+         for (int i = 0; i < 40; ++i) AddTraffic(host, data, "x" + std::to_string(100 + i));
+         host.interfaceCountClaim = static_cast<int>(host.interfaces.size()); },
+     kClean, [](const Json::Value &r) { EXPECT_LE(r["network"].size(), 1u + 32u + 1u + 1u); }},
     {"DeviceCountBeyondItsBlock", [](Host &host, Json::Value &) { host.usb.countClaim = 1000; }, kClean, nullptr},
     {"FlashCacheWithoutSpacePath", [](Host &h, Json::Value &) { h.flashCaches[0].spacePath.reset(); }, kClean, nullptr},
     {"FlashCacheWithoutVolumePath", [](Host &h, Json::Value &) { h.flashCaches[0].volumePath.reset(); }, kClean, nullptr},
-    {"NullErrorFile",
-     [](Host &host, Json::Value &) {
-         host.nullErrorFile = true;
-         korvstandin::SetFault(Op::KLIBCSzHashSetValue, Fault::Fail, 0x0042, korvstandin::Calls::Only(1));
-     },
+    {"NullErrorFile", [](Host &host, Json::Value &) { host.nullErrorFile = true;
+         korvstandin::SetFault(Op::KLIBCSzHashSetValue, Fault::Fail, 0x0042, korvstandin::Calls::Only(1)); },
      {Result::True, kAllMembers, {"fill_in_current_disk_io KLIBCSzHashSetValue failed[0x0042 :4]"}}, nullptr},
 };
 
@@ -263,8 +237,7 @@ TEST_F(FaultSweep, MalformedPlatformAnswers)
         c.arrange(korvstandin::Host(), appliance_.reply["data"]);
         const Outcome outcome = Run();
         EXPECT_EQ(outcome, c.expected);
-        if (c.check != nullptr)
-            c.check(outcome.value);
+        if (c.check != nullptr) c.check(outcome.value);
         EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
     }
 }

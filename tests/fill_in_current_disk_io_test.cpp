@@ -19,13 +19,9 @@
 
 namespace {
 
-using korvstandin::Host;
-using korvstandin::Op;
-using korvtest::Canonical;
-using korvtest::Logged;
-using korvtest::LoggedMessages;
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
+using korvstandin::Host, korvstandin::Op;
+using korvtest::Canonical, korvtest::JsonText, korvtest::Logged, korvtest::LoggedMessages, korvtest::ParseJson;
+using ::testing::ElementsAre, ::testing::IsEmpty;
 
 constexpr char kUnit[] = "fill_in_current_disk_io";
 
@@ -34,13 +30,12 @@ constexpr char kUnit[] = "fill_in_current_disk_io";
 std::vector<std::string> Names(const std::vector<std::string> &devices)
 {
     Json::Value diskIO(Json::arrayValue), out;
-    for (const std::string &device : devices)
-        diskIO.append(Json::Value(Json::objectValue))["device"] = device;
+    for (const std::string &d : devices) diskIO.append(Json::Value(Json::objectValue))["device"] = d;
     EXPECT_TRUE(KORVSNMP::FillInCurrentDiskIO(diskIO, out));
     std::vector<std::string> names;
-    for (const Json::Value &disk : out["disk"])
-        names.push_back(disk["device"].asString() + "=" + disk["display_name"].asString() + "/" +
-                        disk["type"].asString());
+    for (const Json::Value &d : out["disk"])
+        names.push_back(d["device"].asString() + "=" + d["display_name"].asString() + "/" +
+                        d["type"].asString());
     return names;
 }
 
@@ -55,13 +50,8 @@ using DiskIOTest = korvtest::PlatformTest;
 
 TEST_F(DiskIOTest, ExpansionUnitDiskNamesItsFirstPoweredListingUnit)
 {
-    const struct {
-        std::optional<std::string> model;
-        bool powered;
-        const char *name;
-    } cases[] = {
-        {"Korvel-X5", true, "sdc=Disk 3 (X5-2)/ebox"},
-        {"X5", true, "sdc=Disk 3 (X5-2)/ebox"},
+    const struct { std::optional<std::string> model; bool powered; const char *name; } cases[] = {
+        {"Korvel-X5", true, "sdc=Disk 3 (X5-2)/ebox"}, {"X5", true, "sdc=Disk 3 (X5-2)/ebox"},
         {"Korvel-X5", false, "sdc=Disk 3 (Expansion Unit)/ebox"},
         {std::nullopt, true, "sdc=Disk 3 (Expansion Unit)/ebox"},
         // Cut to 31 characters before the prefix is dropped.
@@ -111,12 +101,10 @@ TEST_F(DiskIOTest, MissingTextsReadAsEmpty)
     Host().files.clear();
     Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}, {3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"}};
     EXPECT_THAT(Names({"sda", "sdc"}), ElementsAre("sda= 1/internal", "sdc= 3 ()/ebox"));
-    const auto missing = [](const char *key) {
-        return Logged(LOG_ERR, kUnit, std::string("Fail to get text [volume:") + key + "]");
-    };
-    EXPECT_THAT(LoggedMessages(), ElementsAre(missing("volume_disk"), missing("volume_expansion"),
-                                              missing("dedicated_ssd_cache"), missing("volume_disk"),
-                                              missing("volume_expansion"), missing("dedicated_ssd_cache")));
+    const auto m = [](std::string key) {
+        return Logged(LOG_ERR, kUnit, "Fail to get text [volume:" + key + "]"); };
+    EXPECT_THAT(LoggedMessages(), ElementsAre(m("volume_disk"), m("volume_expansion"), m("dedicated_ssd_cache"),
+                                              m("volume_disk"), m("volume_expansion"), m("dedicated_ssd_cache")));
 }
 
 TEST_F(DiskIOTest, UnitsWithoutWrapperAreNotSearched)
@@ -133,8 +121,7 @@ TEST_F(DiskIOTest, UnitsWithoutWrapperAreNotSearched)
 TEST_F(DiskIOTest, LaterSourceWinsAndFailedQueriesKeepEarlierNames)
 {
     korvstandin::SetJournal(true);
-    Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"},
-                    {2, DISK_CONTAINER_INTERNAL, 0, "/dev/sdb"},
+    Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}, {2, DISK_CONTAINER_INTERNAL, 0, "/dev/sdb"},
                     {3, DISK_CONTAINER_INTERNAL, 0, "/dev/sdc"}};
     Host().usb.devices = {{"sda", "USB A"}, {"sdb", "USB B"}, {"sdc", "USB C", true}, {"sdu", ""}};
     Host().esata.devices = {{"sdb", "eSATA B"}};
@@ -142,8 +129,7 @@ TEST_F(DiskIOTest, LaterSourceWinsAndFailedQueriesKeepEarlierNames)
                 ElementsAre("sdc=Disk 3/internal", "sdb=eSATA B/eSATA", "sda=USB A/usb"));
     std::vector<std::string> external;
     for (const std::string &call : korvstandin::Journal())
-        if (call.rfind("KORV", 0) == 0)
-            external.push_back(call);
+        if (call.rfind("KORV", 0) == 0) external.push_back(call);
     EXPECT_THAT(external, ElementsAre("KORVUSBDevEnum(2, (null), 0)", "KORVUSBDevEnum(2, buffer, 48)",
                                       "KORVExtStgPartsVolInfoGet(sda, 1)", "KORVExtStgPartsVolInfoGet(sdb, 1)",
                                       "KORVExtStgPartsVolInfoGet(sdc, 1)", "KORVExtStgPartsVolInfoGet(sdu, 1)",
@@ -165,39 +151,37 @@ TEST_F(DiskIOTest, QuillboxNamesOnlyExternalDevicesAndAFailedListEndsTheCall)
     Host().usb.neededClaim = -1;
     const int listCalls = korvstandin::CallCount(Op::KORVUSBDevEnum);
     Json::Value out;
-    EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(korvtest::ParseJson(R"([{"device": "sde"}])"), out));
+    EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(ParseJson(R"([{"device": "sde"}])"), out));
     EXPECT_TRUE(out.isNull());
-    EXPECT_THAT(LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, kUnit, "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE")));
+    const char *const failedList = "Failed to KORVExternalDevEnum EXTERNAL_USB_DEVICE";
+    EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, failedList)));
     EXPECT_EQ(korvstandin::CallCount(Op::KORVUSBDevEnum), listCalls + 1);
 }
 
 TEST_F(DiskIOTest, RecordsKeptInOrderWithTheirTotal)
 {
     Host().disks = {{1, DISK_CONTAINER_INTERNAL, 0, "/dev/sda"}, {2, DISK_CONTAINER_INTERNAL, 0, "/dev/sdb"}};
-    Json::Value out = korvtest::ParseJson(R"({"other": true})");
-    ASSERT_TRUE(KORVSNMP::FillInCurrentDiskIO(korvtest::ParseJson(R"([null, {"utilization": 50},
+    Json::Value out = ParseJson(R"({"other": true})");
+    ASSERT_TRUE(KORVSNMP::FillInCurrentDiskIO(ParseJson(R"([null, {"utilization": 50},
         {"device": "sdb", "utilization": 3, "read_access": 1, "read_byte": 4000000000, "write_access": 2,
          "write_byte": 5, "display_name": "old", "queue": "kept"},
         {"device": "sda", "utilization": 4, "read_access": 1, "write_access": 2, "write_byte": 5},
         {"device": "sdz"}, {"device": "sdb", "read_byte": 4000000000}])"), out));
-    EXPECT_EQ(korvtest::JsonText(out), Canonical(R"({"other": true, "disk": [
-        {"device": "sdb", "utilization": 3, "read_access": 1, "read_byte": 4000000000, "write_access": 2,
-         "write_byte": 5, "display_name": "Disk 2", "queue": "kept", "type": "internal"},
-        {"device": "sda", "utilization": 4, "read_access": 1, "read_byte": null, "write_access": 2,
-         "write_byte": 5, "display_name": "Disk 1", "type": "internal"},
-        {"device": "sdb", "utilization": null, "read_access": null, "read_byte": 4000000000,
-         "write_access": null, "write_byte": null, "display_name": "Disk 2", "type": "internal"}],
-        "total": {"device": "total", "utilization": 2, "read_access": 2, "read_byte": 8000000000,
-                  "write_access": 4, "write_byte": 10}})"));
+    EXPECT_EQ(JsonText(out), Canonical(R"({"other": true, "disk": [{"device": "sdb", "utilization": 3,
+        "read_access": 1, "read_byte": 4000000000, "write_access": 2, "write_byte": 5, "display_name": "Disk 2",
+        "queue": "kept", "type": "internal"}, {"device": "sda", "utilization": 4, "read_access": 1,
+        "read_byte": null, "write_access": 2, "write_byte": 5, "display_name": "Disk 1", "type": "internal"},
+        {"device": "sdb", "utilization": null, "read_access": null, "read_byte": 4000000000, "write_access": null,
+        "write_byte": null, "display_name": "Disk 2", "type": "internal"}], "total": {"device": "total",
+        "utilization": 2, "read_access": 2, "read_byte": 8000000000, "write_access": 4, "write_byte": 10}})"));
 
     // The mean rounds down; no records give a zero total.
     ASSERT_TRUE(KORVSNMP::FillInCurrentDiskIO(
-        korvtest::ParseJson(R"([{"device": "sda", "utilization": 3}, {"device": "sdb", "utilization": 4}])"), out));
+        ParseJson(R"([{"device": "sda", "utilization": 3}, {"device": "sdb", "utilization": 4}])"), out));
     EXPECT_EQ(out["total"]["utilization"].asUInt64(), 3u);
     ASSERT_TRUE(KORVSNMP::FillInCurrentDiskIO(Json::Value(Json::arrayValue), out));
-    EXPECT_EQ(korvtest::JsonText(out["total"]), Canonical(R"({"device": "total", "utilization": 0,
-        "read_access": 0, "read_byte": 0, "write_access": 0, "write_byte": 0})"));
+    EXPECT_EQ(JsonText(out["total"]), Canonical(R"({"device": "total", "utilization": 0, "read_access": 0,
+        "read_byte": 0, "write_access": 0, "write_byte": 0})"));
     EXPECT_EQ(out["disk"], Json::Value(Json::arrayValue));
 }
 
@@ -207,13 +191,8 @@ TEST_F(DiskIOTest, BadInputFailsWithOutputUntouched)
     const auto number = [](const char *member) {
         return std::string(R"(DiskIO device [sda]: ")") + member + R"(" is not an unsigned 32-bit number)";
     };
-    const struct {
-        const char *diskIO;
-        std::string message;  // empty: nothing logged
-    } cases[] = {
-        {R"({"device": "sda"})", ""},
-        {R"("sda")", ""},
-        {"null", ""},
+    const struct { const char *diskIO; std::string message; } cases[] = {  // an empty message: nothing logged
+        {R"({"device": "sda"})", ""}, {R"("sda")", ""}, {"null", ""},
         {"[null, 1]", "DiskIO element 1 is not an object"},
         {R"([{"device": "sda"}, {"device": 7}])", R"(DiskIO element 1: "device" is not a string)"},
         {R"([{"device": "sda"}, {"device": "sda", "write_byte": -1}])", number("write_byte")},
@@ -223,13 +202,11 @@ TEST_F(DiskIOTest, BadInputFailsWithOutputUntouched)
     for (const auto &c : cases) {
         SCOPED_TRACE(c.diskIO);
         korvtest::ClearLog();
-        Json::Value out = korvtest::ParseJson(R"({"keep": 1})");
-        EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(korvtest::ParseJson(c.diskIO), out));
-        EXPECT_EQ(korvtest::JsonText(out), Canonical(R"({"keep": 1})"));
-        if (c.message.empty())
-            EXPECT_THAT(LoggedMessages(), IsEmpty());
-        else
-            EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
+        Json::Value out = ParseJson(R"({"keep": 1})");
+        EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(ParseJson(c.diskIO), out));
+        EXPECT_EQ(JsonText(out), Canonical(R"({"keep": 1})"));
+        if (c.message.empty()) EXPECT_THAT(LoggedMessages(), IsEmpty());
+        else EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
     }
 }
 

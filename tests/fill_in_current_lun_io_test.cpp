@@ -15,10 +15,7 @@
 
 namespace {
 
-using korvstandin::LunAnswer;
-using korvstandin::Op;
-using korvtest::ParseJson;
-using ::testing::ElementsAre;
+using korvstandin::LunAnswer, korvstandin::Op, korvtest::ParseJson, ::testing::ElementsAre;
 
 constexpr char kUnit[] = "fill_in_current_lun_io";
 
@@ -57,10 +54,7 @@ TEST_F(LunIOTest, RecordWithoutDeviceGetsTheEmptyText)
 
 TEST_F(LunIOTest, UnusableAnswerLeavesTheUuidAsName)
 {
-    const struct {
-        LunAnswer answer;
-        const char *message;
-    } cases[] = {
+    const struct { LunAnswer answer; const char *message; } cases[] = {
         {LunAnswer::Unsuccessful, "Failed to list LUNs"},    {LunAnswer::SuccessNotBoolean, "Failed to list LUNs"},
         {LunAnswer::WithoutData, "LUNs json data not found"}, {LunAnswer::WithoutLuns, "LUNs json data not found"},
         {LunAnswer::LunsNotArray, "LUNs json data not found"},
@@ -78,10 +72,7 @@ TEST_F(LunIOTest, UnusableAnswerLeavesTheUuidAsName)
 
 TEST_F(LunIOTest, UnreadableInputFailsUntouchedAndEmptyInputAsksNothing)
 {
-    const struct {
-        const char *lunIO;
-        const char *message;
-    } cases[] = {
+    const struct { const char *lunIO; const char *message; } cases[] = {
         {R"({"device": "u-1"})", "LunIO is not array."},
         {R"([{"device": "u-1"}, "u-2"])", "LunIO element 1 is not an object"},
         {R"([{"device": "u-1"}, {"device": 7}])", R"(LunIO element 1: "device" is not a string)"},
@@ -96,7 +87,7 @@ TEST_F(LunIOTest, UnreadableInputFailsUntouchedAndEmptyInputAsksNothing)
         EXPECT_EQ(lunIO, ParseJson(c.lunIO));
         EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
     }
-    korvtest::ClearLog();
+    korvtest::FreshPlatform();
     ExpectRewritten("[]", "[]");
     EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
     EXPECT_EQ(korvstandin::CallCount(Op::APIRunnerExec), 0);

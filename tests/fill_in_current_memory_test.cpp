@@ -15,9 +15,7 @@ namespace {
 
 using korvtest::ParseJson;
 
-using korvtest::Logged;
 using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 
 constexpr char kUnit[] = "fill_in_current_memory";
 
@@ -25,11 +23,7 @@ using MemoryTest = korvtest::PlatformTest;
 
 TEST_F(MemoryTest, MemorySizeComesFromThePlatformElseFromTotalReal)
 {
-    struct Case {
-        unsigned int platform;
-        const char *record;
-        unsigned int expected;
-    } cases[] = {
+    struct Case { unsigned int platform; const char *record; unsigned int expected; } cases[] = {
         {0, R"({"total_real": 2048000})", 2048000},
         {8388608, R"({"total_real": 2048000, "memory_size": 7})", 8388608},
         {16, R"({"total_real": 1, "memory_size": "x", "unknown": {"a": [1, "b"]}, "s": "t"})", 16},
@@ -44,7 +38,7 @@ TEST_F(MemoryTest, MemorySizeComesFromThePlatformElseFromTotalReal)
         EXPECT_EQ(memory, expected) << memory.toStyledString();
     }
     EXPECT_EQ(korvstandin::CallCount(korvstandin::Op::KLIBSystemPhysMemSizeGet), 3);
-    EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
+    EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
 }
 
 TEST_F(MemoryTest, RecordWithoutTotalRealIsCopiedAndFails)
@@ -55,20 +49,16 @@ TEST_F(MemoryTest, RecordWithoutTotalRealIsCopiedAndFails)
     EXPECT_FALSE(KORVSNMP::FillInCurrentMemory(record, memory));
     EXPECT_EQ(memory, record);
     EXPECT_THAT(korvtest::LoggedMessages(),
-                ElementsAre(Logged(LOG_ERR, kUnit, "Memory TotalReal not exist.")));
+                ElementsAre(korvtest::Logged(LOG_ERR, kUnit, "Memory TotalReal not exist.")));
 }
 
 TEST_F(MemoryTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
 {
-    struct Case {
-        const char *record;
-        const char *message;
-    } cases[] = {
+    struct Case { const char *record; const char *message; } cases[] = {
         {R"([{"total_real": 1}])", "Memory record is not an object"},
         {R"({"total_real": "2048"})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
         {R"({"total_real": -1})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
-        {R"({"total_real": 4294967296})",
-         R"(Memory: "total_real" is not an unsigned 32-bit number)"},
+        {R"({"total_real": 4294967296})", R"(Memory: "total_real" is not an unsigned 32-bit number)"},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.record);
@@ -76,7 +66,7 @@ TEST_F(MemoryTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
         Json::Value memory = ParseJson(R"({"earlier": 1})");
         EXPECT_FALSE(KORVSNMP::FillInCurrentMemory(ParseJson(c.record), memory));
         EXPECT_EQ(memory, ParseJson(R"({"earlier": 1})"));
-        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, c.message)));
+        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
     }
 }
 

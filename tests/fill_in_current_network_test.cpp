@@ -16,12 +16,8 @@
 
 namespace {
 
-using korvstandin::Host;
-using korvstandin::NetInterface;
-using korvstandin::NetRole;
-using korvtest::Canonical;
-using korvtest::LoggedMessages;
-using ::testing::ElementsAre;
+using korvstandin::Host, korvstandin::NetInterface, korvstandin::NetRole;
+using korvtest::Canonical, korvtest::Logged, korvtest::LoggedMessages, ::testing::ElementsAre;
 
 constexpr char kUnit[] = "fill_in_current_network";
 
@@ -84,8 +80,8 @@ TEST_F(NetworkTest, EachKindOfInterfaceIsListedByItsOwnRule)
                          {"ovs1", NetRole::OvsMaster}, {"ab", NetRole::OvsMaster}, {"eth4"}};
     Host().interfaces[4].ovsMasterAnswer = -7;  // any answer but 0 and 2
     Host().interfaces[6].vlanQueryFails = true;
-    EXPECT_EQ(Fill(R"([{"device": "dkos0"}, {"device": "dko"}, {"device": "dkos5"},
-                       {"device": "eth3"}, {"device": "", "rx": 1}, {"device": "eth4"}])"),
+    EXPECT_EQ(Fill(R"([{"device": "dkos0"}, {"device": "dko"}, {"device": "dkos5"}, {"device": "eth3"},
+                       {"device": "", "rx": 1}, {"device": "eth4"}])"),
               Canonical(R"([{"device": "total", "rx": 2, "tx": 0}, {"device": "", "rx": 1}, {"device": "", "rx": 1},
                         {"device": "dko"}, {"device": "dkos5"}, {"device": "eth3"}])"));
 }
@@ -94,8 +90,7 @@ TEST_F(NetworkTest, VlanRecordIsZeroedOncePerCallNotPerInterface)
 {
     Host().interfaces = {Vlan("eth0.7", ""), Vlan("eth0.5", "vlan5"), Vlan("eth0.6", "vlan6")};
     // The first and third answer "VLAN" without writing the record.
-    Host().interfaces[0].vlanRecordUnwritten = true;
-    Host().interfaces[2].vlanRecordUnwritten = true;
+    Host().interfaces[0].vlanRecordUnwritten = Host().interfaces[2].vlanRecordUnwritten = true;
     EXPECT_EQ(Fill(R"([{"device": "vlan5", "rx": 1}, {"device": "", "rx": 10}])"),
               Canonical(R"([{"device": "total", "rx": 12, "tx": 0}, {"device": "", "rx": 10},
                         {"device": "vlan5", "rx": 1}, {"device": "vlan5", "rx": 1}])"));
@@ -111,23 +106,18 @@ TEST_F(NetworkTest, EmptySectionGivesTheZeroTotalAndNoInterfaceTheBareOne)
 
     korvtest::FreshPlatform();  // a platform that lists nothing fails as one that fails
     EXPECT_EQ(Fill(R"([{"device": "eth0", "rx": 1}])", false), Canonical(R"([{"device": "total"}])"));
-    EXPECT_THAT(LoggedMessages(),
-                ElementsAre(korvtest::Logged(LOG_ERR, kUnit, "Failed to get net interface, errno=0x0")));
+    EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, "Failed to get net interface, errno=0x0")));
 }
 
 TEST_F(NetworkTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
 {
     Host().interfaces = {{"eth0"}, Aggregation("bond0", {"eth1"})};
-    const auto number = [](const char *device, const char *member) {
-        return std::string("Network device [") + device + "]: \"" + member + "\" is not an unsigned 32-bit number";
-    };
-    const struct {
-        const char *network;
-        std::string message;
-    } cases[] = {
+    const auto number = [](std::string device, const char *member) {
+        return "Network device [" + device + "]: \"" + member + "\" is not an unsigned 32-bit number"; };
+    const struct { const char *network; std::string message; } cases[] = {
         {R"({"device": "eth0"})", "ReplyNetwork is not array"},
-        {R"([{"device": "eth0"}, 3])", "Network element 1 is not an object"},
         {R"([["eth0"]])", "Network element 0 is not an object"},
+        {R"([{"device": "eth0"}, 3])", "Network element 1 is not an object"},
         {R"([{"device": "eth0", "rx": -1}])", number("eth0", "rx")},
         {R"([{"device": "eth0", "tx": 4294967296}])", number("eth0", "tx")},
         {R"([{"device": "eth1", "rx": "12"}])", number("eth1", "rx")},
@@ -136,7 +126,7 @@ TEST_F(NetworkTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
         SCOPED_TRACE(bad.network);
         korvtest::ClearLog();
         EXPECT_EQ(Fill(bad.network, false), Canonical(R"("earlier")"));
-        EXPECT_THAT(LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, kUnit, bad.message)));
+        EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, bad.message)));
     }
 }
 

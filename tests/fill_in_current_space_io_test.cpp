@@ -51,9 +51,7 @@ using SpaceIOTest = korvtest::PlatformTest;
 TEST_F(SpaceIOTest, UnreadableInputFailsUntouchedAndEmptyInputGivesNoVolumes)
 {
     korvstandin::Host().spaces = {{"/dev/none", "vol"}};
-    const struct {
-        const char *spaceIO, *message;
-    } cases[] = {
+    const struct { const char *spaceIO, *message; } cases[] = {
         {R"({"device": "total"})", "SpaceIO is not array."},
         {R"([{"device": "total"}, 3])", "SpaceIO element 1 is not an object"},
         {R"([{"device": "total"}, {"device": 7}])", R"(SpaceIO element 1: "device" is not a string)"},
@@ -74,14 +72,11 @@ TEST_F(SpaceIOTest, UnreadableInputFailsUntouchedAndEmptyInputGivesNoVolumes)
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
 }
 
-class SpaceIONodeTest : public SpaceIOTest {
-protected:
+struct SpaceIONodeTest : SpaceIOTest {
     void SetUp() override
     {
         SpaceIOTest::SetUp();
-        std::string whyNot;
-        if (!nodes_.Make(5, whyNot))
-            GTEST_SKIP() << whyNot;
+        if (std::string whyNot; !nodes_.Make(5, whyNot)) GTEST_SKIP() << whyNot;
         directory_ = nodes_.Directory();
         std::ofstream(directory_ + "/regular") << "not a device";
     }
@@ -126,13 +121,11 @@ TEST_F(SpaceIONodeTest, EachCacheSuppressesOneSpaceWithItsPath)
     const std::string cachesAndPlain = Record(1, R"("display_name": "/cache1")") + ", " +
                                        Record(2, R"("display_name": ")" + cut + '"') + ", " +
                                        Record(3, R"("display_name": ")" + cut + '"');
-    Json::Value space = Fill(spaceIO);
-    EXPECT_EQ(space["volume"], Parse("[" + cachesAndPlain + "]"));
+    EXPECT_EQ(Fill(spaceIO)["volume"], Parse("[" + cachesAndPlain + "]"));
 
     // A third space with the cached path is beyond what the two caches take.
     korvstandin::Host().spaces.insert(korvstandin::Host().spaces.begin() + 2, {Node(0), "third"});
-    space = Fill(spaceIO);
-    EXPECT_EQ(space["volume"], Parse("[" + Record(0, R"("display_name": "third")") + ", " + cachesAndPlain + "]"));
+    EXPECT_EQ(Fill(spaceIO)["volume"], Parse("[" + Record(0, R"("display_name": "third")") + ", " + cachesAndPlain + "]"));
 }
 
 // A node that is missing, not a device or has no /sys/dev/block link names

@@ -6,7 +6,7 @@
 
 #include <cstdlib>
 #include <fstream>
-#include <sstream>
+#include <iterator>
 #include <string>
 
 #include <gmock/gmock.h>
@@ -25,8 +25,7 @@ namespace {
 
 // A host file in a temporary directory, named to the stand-in through the
 // environment for the test's lifetime.
-class HostFileTest : public korvtest::PlatformTest {
-protected:
+struct HostFileTest : korvtest::PlatformTest {
     ~HostFileTest() override { unsetenv(korvstandin::kHostFileVariable); std::remove(path_.c_str()); korvstandin::Reset(); }
 
     // Writes `text` as the host file and lets the next platform call read it.
@@ -43,21 +42,18 @@ protected:
 
 std::string FileText(const char *path)
 {
-    std::stringstream text;
-    text << std::ifstream(path).rdbuf();
-    return text.str();
+    std::ifstream in(path);
+    return {std::istreambuf_iterator<char>(in), {}};
 }
 
 TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
 {
     const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
+    const size_t spaces = static_cast<size_t>(shape.spaces);
     korvtest::BlockNodes nodes;
-    std::string whyNot;
-    if (!nodes.Make(static_cast<size_t>(shape.spaces), whyNot))
-        GTEST_SKIP() << whyNot;
+    if (std::string whyNot; !nodes.Make(spaces, whyNot)) GTEST_SKIP() << whyNot;
     std::vector<korvexample::SpaceDevice> devices;
-    for (size_t i = 0; i < static_cast<size_t>(shape.spaces); ++i)
-        devices.push_back({nodes.Node(i), nodes.Name(i)});
+    for (size_t i = 0; i < spaces; ++i) devices.push_back({nodes.Node(i), nodes.Name(i)});
     const korvexample::Appliance appliance = korvexample::MakeAppliance(shape, devices);
     const Json::Value request(Json::objectValue);
     korvstandin::Host() = appliance.host;
@@ -92,19 +88,14 @@ TEST_F(HostFileTest, LargeApplianceExampleFilesMatch)
     EXPECT_THAT(korvtest::LoggedMessages(), ::testing::IsEmpty());
 }
 
-struct BadFile {
-    const char *name;
-    std::string text;
-    const char *error;  // what the message says after the file's path
-    bool absent = false;  // the file is gone before it is read
-};
+// `error`: what the message says after the file's path; `absent`: the file is gone before it is read.
+struct BadFile { const char *name; std::string text; const char *error; bool absent = false; };
 
 // `count` copies of `element`, separated by commas.
 std::string Repeated(const std::string &element, int count)
 {
     std::string list = element;
-    for (int i = 1; i < count; ++i)
-        list += "," + element;
+    for (int i = 1; i < count; ++i) list += "," + element;
     return list;
 }
 
@@ -139,8 +130,7 @@ TEST_F(HostFileTest, BadFileFailsEveryOperationWithOneMessage)
     for (const BadFile &bad : kBadFiles) {
         SCOPED_TRACE(bad.name);
         UseHostFile(bad.text);
-        if (bad.absent)
-            std::remove(path_.c_str());
+        if (bad.absent) std::remove(path_.c_str());
 
         KLIBNetInterfaceInfo records[4] = {};
         EXPECT_EQ(KLIBNetGetInterfaceInfo(records, 4, 6), -1);

@@ -16,20 +16,16 @@
 namespace {
 
 namespace fs = std::filesystem;
-using korvstandin::HostDescription;
-using korvstandin::NetRole;
-using ::testing::ElementsAre;
+using korvstandin::HostDescription, korvstandin::NetRole, ::testing::ElementsAre;
 
-class LiveHostTest : public korvtest::PlatformTest {
-protected:
+struct LiveHostTest : korvtest::PlatformTest {
     ~LiveHostTest() override { fs::remove_all(root_); }
 
     // Writes `text` at `path` under the root; with no text, makes a directory.
     void Write(const std::string &path, const char *text = nullptr)
     {
         fs::create_directories(text != nullptr ? (root_ / path).parent_path() : root_ / path);
-        if (text != nullptr)
-            std::ofstream(root_ / path) << text;
+        if (text != nullptr) std::ofstream(root_ / path) << text;
     }
 
     // Made by the first Write; left absent by a test that writes nothing.
@@ -38,8 +34,7 @@ protected:
 
 TEST_F(LiveHostTest, DisksSpacesAndLunsAreProbed)
 {
-    for (const char *disk : {"sda", "sdaa", "sdb"})
-        Write(std::string("sys/block/") + disk + "/device");
+    for (const char *disk : {"sda", "sdaa", "sdb"}) Write(std::string("sys/block/") + disk + "/device");
     Write("sys/block/loop0");  // no hardware behind it
     Write("sys/devices/pci0/usb2/2-1/host6/block/sdc/device/vendor", "Kingston \n");
     Write("sys/devices/pci0/usb2/2-1/host6/block/sdc/device/model", "DataTraveler\n");
@@ -61,8 +56,7 @@ TEST_F(LiveHostTest, DisksSpacesAndLunsAreProbed)
                               "/dev/vdb1 /volume\\0401 xfs rw 0 0\n/dev/vda1 /mnt/again ext4 rw 0 0\n");
     korvstandin::live::ProbeSpaces(root_.string(), host);
     std::vector<std::string> spaces;
-    for (const korvstandin::Space &space : host.spaces)
-        spaces.push_back(space.devicePath + "=" + space.name);
+    for (const korvstandin::Space &space : host.spaces) spaces.push_back(space.devicePath + "=" + space.name);
     EXPECT_THAT(spaces, ElementsAre("/dev/vda1=root", "/dev/vdb1=volume 1"));
 
     Write("sys/kernel/config/target/core/iblock_0/lun_a/wwn/vpd_unit_serial",
@@ -78,9 +72,8 @@ TEST_F(LiveHostTest, InterfacesWithVlansBondsAndPpp)
     for (const char *name : {"lo", "eth0", "eth1", "eth0.5", "ppp0"})
         Write(std::string("sys/class/net/") + name);
     Write("sys/class/net/bond0/bonding/slaves", "eth0 eth1\n");
-    Write("proc/net/vlan/config",
-          "VLAN Dev name    | VLAN ID\nName-Type: VLAN_NAME_TYPE_RAW_PLUS_VID_NO_PAD\n"
-          "eth0.5         | 5  | eth0\n");
+    Write("proc/net/vlan/config", "VLAN Dev name    | VLAN ID\nName-Type: VLAN_NAME_TYPE_RAW_PLUS_VID_NO_PAD\n"
+                                  "eth0.5         | 5  | eth0\n");
     const std::string root = root_.string();
     using korvstandin::live::ProbeInterface;
 

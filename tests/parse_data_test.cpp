@@ -16,9 +16,7 @@
 
 namespace {
 
-using korvtest::LoggedMessages;
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
+using korvtest::LoggedMessages, ::testing::ElementsAre, ::testing::IsEmpty;
 using Members = std::set<std::string>;
 
 const auto Parse = korvtest::ParseJson;
@@ -61,16 +59,10 @@ TEST_F(ParseDataTest, EverySectionIsTakenOverWithTime)
 // the call that fails.
 TEST_F(ParseDataTest, RequestSelectsTheSectionsAndTheFirstBadOneEndsTheAssembly)
 {
-    const struct {
-        const char *request;
-        const char *member;   // the reply's data member to replace (or drop)
-        const char *value;    // its new value; "" drops it
-        const char *message;  // "" when nothing is logged
-        bool succeeds;
-        Members members;
-    } cases[] = {
-        {"{}", "", "", "", true, kEverySection},
-        {"null", "", "", "", true, kEverySection},
+    // `member`: the reply's data member to replace with `value` ("" drops it);
+    // `message`: "" when nothing is logged.
+    const struct { const char *request, *member, *value, *message; bool succeeds; Members members; } cases[] = {
+        {"{}", "", "", "", true, kEverySection}, {"null", "", "", "", true, kEverySection},
         {R"({"resource": []})", "", "", "", true, kEverySection},
         {R"({"resource": ["disk", "all"]})", "", "", "", true, kEverySection},
         {R"({"resource": ["memory"]})", "System", "", "", true, {"memory", "time"}},  // memory needs no cpu
@@ -94,33 +86,25 @@ TEST_F(ParseDataTest, RequestSelectsTheSectionsAndTheFirstBadOneEndsTheAssembly)
         SCOPED_TRACE(std::string(c.member) + " " + c.value + " asked by " + c.request);
         korvtest::ClearLog();
         Json::Value reply = FullReply();
-        if (*c.value == '\0')
-            reply["data"].removeMember(c.member);
-        else
-            reply["data"][c.member] = Parse(c.value);
+        if (*c.value == '\0') reply["data"].removeMember(c.member);
+        else reply["data"][c.member] = Parse(c.value);
         Json::Value result = Parse(R"({"kept": true})");
         EXPECT_EQ(SNMPParseReplyData(Parse(c.request), reply, result), c.succeeds);
         EXPECT_TRUE(result.removeMember("kept", nullptr));
         EXPECT_EQ(MembersOf(result), c.members);
-        if (*c.message == '\0')
-            EXPECT_THAT(LoggedMessages(), IsEmpty());
-        else
-            EXPECT_THAT(LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, "parse_data", c.message)));
+        if (*c.message == '\0') EXPECT_THAT(LoggedMessages(), IsEmpty());
+        else EXPECT_THAT(LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, "parse_data", c.message)));
     }
 }
 
 TEST_F(ParseDataTest, ValuesOfTheWrongTypeFailWithAMessage)
 {
     const Json::Value array(Json::arrayValue);
-    const auto types = [](const char *types) {
-        return "Request, reply and result must be JSON objects (types " + std::string(types) + ")";
-    };
+    const auto types = [](std::string t) {
+        return "Request, reply and result must be JSON objects (types " + t + ")"; };
     Json::Value dataArray = FullReply();
     dataArray["data"] = array;
-    const struct {
-        Json::Value request, reply, result;
-        std::string message;
-    } cases[] = {
+    const struct { Json::Value request, reply, result; std::string message; } cases[] = {
         {array, FullReply(), Json::Value(), types("6, 7, 0")},
         {Json::Value(), Json::Value("reply"), Json::Value(), types("0, 4, 0")},
         {Json::Value(), dataArray, Json::Value(), "Reply data is not a JSON object (type 6)"},
