@@ -106,26 +106,17 @@ TEST(KorvsnmpcdParsers, BlockDevicesOfEveryKernelLayoutAndMountSources)
 
 TEST(KorvsnmpcdRates, CounterRules)
 {
-    struct Case {
-        uint64_t before, after, elapsedMs;
-        uint32_t rate;
-    } cases[] = {
-        {100, 1100, 1000, 1000},                      // per second
-        {100, 1100, 500, 2000},                       // over half a second
-        {0, 2, 3000, 1},                              // rounded to nearest
-        {1100, 100, 1000, 0},                         // backwards: reset or wrapped
-        {4294967290u, 5, 1000, 0},                    // a 32-bit kernel counter wrapping
-        {0, 10, 0, 0},                                // no time elapsed
-        {0, 4294967296ull, 1000, kUint32Max},         // clamped to 32 bits
-        {0, 18446744073709551615ull, 1, kUint32Max},  // no overflow on the way
-    };
-    for (const Case &c : cases) {
+    struct Case { uint64_t before, after, elapsedMs; uint32_t rate; } cases[] = {
+        {100, 1100, 1000, 1000}, {100, 1100, 500, 2000},  // per second, over half a second
+        {0, 2, 3000, 1}, {1100, 100, 1000, 0},  // rounded to nearest; backwards: reset or wrapped
+        {4294967290u, 5, 1000, 0}, {0, 10, 0, 0},  // a 32-bit kernel counter wrapping; no time elapsed
+        // clamped to 32 bits; no overflow on the way
+        {0, 4294967296ull, 1000, kUint32Max}, {0, 18446744073709551615ull, 1, kUint32Max}};
+    for (const Case &c : cases)
         EXPECT_EQ(korvsnmpcd::CounterRate(c.before, c.after, c.elapsedMs), c.rate)
             << c.before << " -> " << c.after << " in " << c.elapsedMs << " ms";
-    }
-    EXPECT_EQ(korvsnmpcd::BusyPercent(1000, 1500, 1000), 50u);
-    EXPECT_EQ(korvsnmpcd::BusyPercent(1000, 3000, 1000), 100u);  // never above 100
-    EXPECT_EQ(korvsnmpcd::BusyPercent(3000, 1000, 1000), 0u);
+    auto busy = [](uint64_t before, uint64_t after) { return korvsnmpcd::BusyPercent(before, after, 1000); };
+    EXPECT_THAT(Fields({busy(1000, 1500), busy(1000, 3000), busy(3000, 1000)}), ElementsAre(50, 100, 0));
 }
 
 TEST(KorvsnmpcdRates, CpuShares)
@@ -139,10 +130,8 @@ TEST(KorvsnmpcdRates, CpuShares)
     EXPECT_EQ(korvsnmpcd::CpuPercentages(after, after).idle, 100u);
 }
 
-BlockCounters Block(unsigned minor, uint64_t reads, uint64_t sectors, uint64_t ticks = 0)
-{
-    return {8, minor, reads, sectors, reads * 2, sectors * 2, ticks};
-}
+BlockCounters Block(unsigned minor, uint64_t reads, uint64_t sectors, uint64_t ticks = 0) {
+    return {8, minor, reads, sectors, reads * 2, sectors * 2, ticks}; }
 
 TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
 {
@@ -153,8 +142,7 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
     after.blocks = {{"sda", Block(0, 30, 300, 1000)},  // steady
                     {"sdc", Block(48, 999999, 999999)},  // replaced by another device
                     {"sdd", Block(64, 500000, 500000)}};  // new
-    after.disks = {"sda", "sdc", "sdd"};
-    after.mounted = {"sda", "sdd", "sdx"};  // sdx has no counters
+    after.disks = {"sda", "sdc", "sdd"}, after.mounted = {"sda", "sdd", "sdx"};  // sdx has no counters
     after.interfaces = {{"eth0", {3000, 2000}}, {"ppp0", {123456789, 1}}};
 
     korvsnmpcd::Rates rates = korvsnmpcd::ComputeRates(before, after);
@@ -166,19 +154,18 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
                   disk == std::string("sda") ? steady : std::vector<uint64_t>(5, 0)) << disk;
     }
     ASSERT_EQ(rates.spaces.size(), 2u);  // sda and sdd
-    EXPECT_EQ(rates.spaceTotal.readByte, 100u * 512);
-    EXPECT_EQ(rates.spaceTotal.utilization, 25u);  // mean of 50 and 0
+    EXPECT_THAT(Fields({rates.spaceTotal.readByte, rates.spaceTotal.utilization}),
+                ElementsAre(100 * 512, 25));  // the mean of 50 and 0
     EXPECT_THAT(Fields({rates.interfaces.at("eth0").rx, rates.interfaces.at("eth0").tx,
                         rates.interfaces.at("ppp0").rx, rates.interfaces.count("eth1")}),
                 ElementsAre(1000, 0, 0, 0));
 
     before.blocks = {{"sda", Block(0, 0, 0)}, {"sdb", Block(16, 0, 0)}};  // totals clamp, not wrap
-    before.monotonicMs = after.monotonicMs - 1000;
+    before.monotonicMs = after.monotonicMs - 1000, after.mounted = {"sda", "sdb"};
     after.blocks = {{"sda", Block(0, 3000000000u, 0)}, {"sdb", Block(16, 3000000000u, 0)}};
-    after.mounted = {"sda", "sdb"};
     rates = korvsnmpcd::ComputeRates(before, after);
-    EXPECT_EQ(rates.spaces.at("sda").writeAccess, kUint32Max);
-    EXPECT_EQ(rates.spaceTotal.readAccess, kUint32Max);
+    EXPECT_THAT(Fields({rates.spaces.at("sda").writeAccess, rates.spaceTotal.readAccess}),
+                ElementsAre(kUint32Max, kUint32Max));
 }
 
 // ---------------------------------------------------------------- replies
@@ -186,10 +173,8 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
 TEST(KorvsnmpcdReply, StatisticsSections)
 {
     korvsnmpcd::Rates rates;
-    rates.interfaces["eth0"] = {7, 8};
-    rates.disks["sda"] = {1, 2, 3, 4, 5};
-    rates.spaces["sda1"] = {6, 7, 8, 9, 10};
-    rates.spaceTotal = {6, 7, 8, 9, 10};
+    rates.interfaces["eth0"] = {7, 8}, rates.disks["sda"] = {1, 2, 3, 4, 5};
+    rates.spaces["sda1"] = {6, 7, 8, 9, 10}, rates.spaceTotal = {6, 7, 8, 9, 10};
     Snapshot sample;
     sample.memory.totalKiB = 8000000000ull, sample.epochSeconds = 1700000000;  // memory beyond 32 bits: clamped
 
@@ -211,18 +196,14 @@ TEST(KorvsnmpcdAnswer, RequestKindsRepliesAndLog)
 {
     using korvsnmpcd::RequestKind;
     korvtest::ClearLog();
-    const struct {
-        std::string body;
-        RequestKind kind;
-    } cases[] = {
+    const struct { std::string body; RequestKind kind; } cases[] = {
         {std::string("{\"request\":\"reload\"}\n\0", 22), RequestKind::kControl},
         {"{\"reason\":\"disk swap\",\"request\":\"history_mode\"}\n", RequestKind::kControl},
         {"{\"resource\":[\"all\"]}\n", RequestKind::kStatistics}, {"{}", RequestKind::kStatistics},
         {"{\"request\":\"other\"}", RequestKind::kStatistics}, {"{\"request\":7}", RequestKind::kStatistics},
         {"garbage", RequestKind::kNotAnObject}, {"[1,2]", RequestKind::kNotAnObject}, {"7", RequestKind::kNotAnObject},
         {"", RequestKind::kNotAnObject}, {"{\"a\":", RequestKind::kNotAnObject},
-        {std::string(100000, '['), RequestKind::kNotAnObject},
-    };
+        {std::string(100000, '['), RequestKind::kNotAnObject}};
     for (const auto &c : cases)
         EXPECT_EQ(korvsnmpcd::ReadRequest(c.body), c.kind) << c.body.substr(0, 20);
     // Only the control requests log; the server counts refusals.
@@ -238,30 +219,20 @@ TEST(KorvsnmpcdAnswer, RequestKindsRepliesAndLog)
 
 constexpr auto kPrompt = std::chrono::milliseconds(400);  // well within the client timeout
 
-std::string Statistics(const std::string &path)
-{
-    Json::Value request;
-    request["resource"].append("all");
-    return korvtest::ExchangeWith(path, korvproto::EncodeRequestFrame(request));
-}
-
-bool Answers(const std::string &path)
-{
-    return korvtest::ParseJson(Statistics(path))["data"]["Memory"].isArray();
-}
-
-std::string TestSocketPath(const char *tag)
-{
-    return "/tmp/korvsnmpcd-test-" + std::to_string(getpid()) + "-" + tag + ".sock";
-}
+// The daemon's reply on `path` to the request `json`.
+std::string Ask(const std::string &path, const char *json) {
+    return korvtest::ExchangeWith(path, korvproto::EncodeRequestFrame(korvtest::ParseJson(json))); }
+std::string Statistics(const std::string &path) { return Ask(path, R"({"resource": ["all"]})"); }
+bool Answers(const std::string &path) {
+    return korvtest::ParseJson(Statistics(path))["data"]["Memory"].isArray(); }
+std::string TestSocketPath(const char *tag) {
+    return "/tmp/korvsnmpcd-test-" + std::to_string(getpid()) + "-" + tag + ".sock"; }
 
 // The built daemon on socket `path`; its output goes to a file of its own, `path` + `logTag` + ".log".
 std::unique_ptr<korvtest::CollectorProcess> StartDaemon(const std::string &path, const char *logTag = "")
 {
-    return std::make_unique<korvtest::CollectorProcess>(
-        KORVSNMPCD_PATH,
-        std::vector<std::string>{"--foreground", "--socket", path, "--interval", "0.05",
-                                 "--client-timeout", "0.6"},
+    return std::make_unique<korvtest::CollectorProcess>(KORVSNMPCD_PATH, std::vector<std::string>{
+        "--foreground", "--socket", path, "--interval", "0.05", "--client-timeout", "0.6"},
         path + logTag + ".log");
 }
 
@@ -299,10 +270,7 @@ TEST_F(KorvsnmpcdDaemon, StatisticsReplyOfThisHost)
 
 TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDroppedAndLeavesNothingOpen)
 {
-    Json::Value history;
-    history["request"] = "history_mode";
-    history["reason"] = "nightly backup";
-    EXPECT_EQ(korvtest::ExchangeWith(path_, korvproto::EncodeRequestFrame(history)), "{\"success\":true}");
+    EXPECT_EQ(Ask(path_, R"({"request": "history_mode", "reason": "nightly backup"})"), "{\"success\":true}");
     EXPECT_THAT(daemon_->Log(), HasSubstr("History mode requested, reason: [nightly backup]"));
     const std::string garbage = korvproto::EncodeFramePrefix(8) + "garbage!";
     EXPECT_EQ(korvtest::ParseJson(korvtest::ExchangeWith(path_, garbage))["success"], false);
@@ -324,10 +292,9 @@ TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDroppedAndLeavesNothingOpen)
     }
     EXPECT_TRUE(Answers(path_));
     // The daemon closes the last of them as it notices that their clients left.
-    for (Clock::time_point giveUp = Clock::now() + korvtest::kProcessWait;
-         korvtest::OpenDescriptorCount(daemon_->Pid()) != descriptors && Clock::now() < giveUp;)
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    EXPECT_EQ(korvtest::OpenDescriptorCount(daemon_->Pid()), descriptors);
+    EXPECT_TRUE(korvtest::Eventually(
+        [&] { return korvtest::OpenDescriptorCount(daemon_->Pid()) == descriptors; }))
+        << korvtest::OpenDescriptorCount(daemon_->Pid()) << " open, not " << descriptors;
 }
 
 TEST(KorvsnmpcdLifecycle, SecondDaemonRefusedStaleSocketReplacedOtherFileKept)
