@@ -11,6 +11,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include "collector_process.h"
 #include "counters.h"
 #include "json_text.h"
 #include "openmetrics_format.h"
@@ -196,11 +197,8 @@ Outcome RunCommand(const std::string &command, const std::string &input = "")
     for (char *path : {in, out, err}) close(mkstemp(path));
     std::ofstream(in, std::ios::binary) << input;
     const int status = std::system(("{ " + command + "; } <" + in + " >" + out + " 2>" + err).c_str());
-    auto text = [](const char *path) {
-        std::ifstream file(path, std::ios::binary);
-        return std::string(std::istreambuf_iterator<char>(file), {});
-    };
-    const Outcome run{WIFEXITED(status) ? WEXITSTATUS(status) : -1, text(out), text(err)};
+    const Outcome run{WIFEXITED(status) ? WEXITSTATUS(status) : -1, korvtest::ReadWholeFile(out),
+                      korvtest::ReadWholeFile(err)};
     for (const char *path : {in, out, err}) unlink(path);
     return run;
 }

@@ -261,7 +261,6 @@ TEST_F(KorvsnmpcdDaemon, StatisticsReplyOfThisHost)
     EXPECT_EQ(data["Memory"][0]["total_real"].asUInt(), memory.totalKiB);
     EXPECT_EQ(data["System"].size(), 1u);
     EXPECT_THAT(korvtest::JsonText(data["Network"]), HasSubstr("{\"device\":\"lo\",\"rx\":"));
-    ASSERT_GE(data["SpaceIO"].size(), 1u);
     EXPECT_EQ(data["SpaceIO"][data["SpaceIO"].size() - 1]["device"], "total");
     EXPECT_TRUE(data["iSCSI"].isArray() && data.isMember("NFS")) << data;
     const auto now = std::chrono::system_clock::now().time_since_epoch();
