@@ -177,8 +177,8 @@ TEST(KorvsnmpStatTables, HumanBytesAndExactText)
 TEST(KorvsnmpStatOpenMetrics, LabelValuesAreEscapedAndValidUtf8)
 {
     const std::pair<std::string, std::string> cases[] = {
-        {"Disk 1", "Disk 1"},            {"say \"hi\"", "say \\\"hi\\\""},
-        {"C:\\share", "C:\\\\share"},    {"two\nlines", "two\\nlines"},
+        {"Disk 1", "Disk 1"}, {"say \"hi\"", "say \\\"hi\\\""},
+        {"C:\\share", "C:\\\\share"}, {"two\nlines", "two\\nlines"},
         {"Datenträger 🙂", "Datenträger 🙂"}, {"latin1 \xE4!", "latin1 \xEF\xBF\xBD!"},
         {"\xC0\xAF", "\xEF\xBF\xBD\xEF\xBF\xBD"},              // overlong '/'
         {"\xED\xA0\x80", "\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"},  // a surrogate
@@ -225,8 +225,7 @@ std::vector<std::string> ParsedSamples(const std::string &exposition)
         EXPECT_EQ(family, sample) << line;
         // The classic parser knows no units and reads every value as a float.
         (parser == "classic" ? classic : unitless).push_back(sample + rest);
-        if (parser == "openmetrics")
-            openmetrics.push_back(sample + " " + unit + rest);
+        if (parser == "openmetrics") openmetrics.push_back(sample + " " + unit + rest);
     }
     for (const std::string &sample : unitless)
         EXPECT_THAT(classic, Contains(sample)) << "the classic parser lacks it";
@@ -329,7 +328,8 @@ TEST(KorvsnmpStatProgram, PrintsTheAssembledResultAsJsonTablesAndOpenMetrics)
     EXPECT_THAT(Lines(table.out),
                 ElementsAre("Sample time  2026-11-18T07:36:40-03:30", "", "CPU", "state  share (%)",
                             "user          12", "idle          88", "", "NFS",
-                            "read_byte (B/s)  write_byte (B/s)  calls (/s)", "              5                 -           -", ""));
+                            "read_byte (B/s)  write_byte (B/s)  calls (/s)",
+                            "              5                 -           -", ""));
     EXPECT_EQ(metrics.status, 0) << metrics.err;
     EXPECT_THAT(ParsedSamples(metrics.out),
                 ElementsAre("korvsnmp_cpu_user_percent percent {} 12.0",
