@@ -83,15 +83,12 @@ TEST(KorvsnmpcdProgram, DaemonKeepsNoneOfItsCallersDescriptors)
     int ends[2];
     ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
     korvproto::UniqueFd readEnd(ends[0]);
-    pid_t daemon = -1;
-    {
-        CollectorProcess caller(KORVSNMPCD_PATH, {"--daemon", "--socket", socket, "--pidfile", pidFile},
-                                TestPath("daemon.log"), ends[1], kCallersPipe);
-        close(ends[1]);
-        ASSERT_EQ(caller.WaitForExit(), 0) << caller.Log();  // it returns once the daemon is ready
-        daemon = std::stoi(korvtest::ReadWholeFile(pidFile));
-        ASSERT_GT(daemon, 1);
-    }
+    CollectorProcess caller(KORVSNMPCD_PATH, {"--daemon", "--socket", socket, "--pidfile", pidFile},
+                            TestPath("daemon.log"), ends[1], kCallersPipe);
+    close(ends[1]);
+    ASSERT_EQ(caller.WaitForExit(), 0) << caller.Log();  // it returns once the daemon is ready
+    const pid_t daemon = std::stoi(korvtest::ReadWholeFile(pidFile));
+    ASSERT_GT(daemon, 1);
     EXPECT_TRUE(Running(daemon));
     EXPECT_EQ(korvtest::ExchangeWith(socket, kReload), "{\"success\":true}");
     CollectorProcess probe(KORVSNMPCD_PATH, {"--probe", "--socket", socket}, TestPath("probe.log"));
@@ -121,27 +118,24 @@ TEST(KorvsnmpcdReplay, ReadyToTheServiceManagerRecordedReplyServedAndFollowingIt
     korvproto::UniqueFd listener(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
     const sockaddr_un address = korvtest::SocketAddress(manager);
     ASSERT_EQ(bind(listener.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address), 0);
-    std::string live;
-    {
-        setenv("NOTIFY_SOCKET", manager.c_str(), 1);
-        CollectorProcess recorder(KORVSNMPCD_PATH, {"--socket", socket, "--record", recorded}, TestPath("record.log"));
-        unsetenv("NOTIFY_SOCKET");
-        pollfd notified = {listener.Get(), POLLIN, 0};
-        char message[64] = {};
-        ASSERT_EQ(poll(&notified, 1, 10000), 1) << recorder.Log();
-        EXPECT_EQ(recv(listener.Get(), message, sizeof message - 1, 0), 7);
-        EXPECT_STREQ(message, "READY=1");
-        EXPECT_EQ(access(socket.c_str(), F_OK), 0) << "ready before it listens";
-        EXPECT_EQ(korvtest::ExchangeWith(socket, kReload), "{\"success\":true}");
-        EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "a control reply was recorded";
-        live = korvtest::ExchangeWith(socket, kStatistics);
-        ASSERT_THAT(live, HasSubstr("{\"data\":"));
-        EXPECT_EQ(korvtest::ReadWholeFile(recorded), live + "\n");
-        ASSERT_EQ(unlink(recorded.c_str()), 0);
-        EXPECT_FALSE(korvtest::ExchangeWith(socket, kStatistics).empty());
-        EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "only the next reply is recorded";
-        EXPECT_EQ(recorder.Stop(SIGTERM), 0);
-    }
+    setenv("NOTIFY_SOCKET", manager.c_str(), 1);
+    CollectorProcess recorder(KORVSNMPCD_PATH, {"--socket", socket, "--record", recorded}, TestPath("record.log"));
+    unsetenv("NOTIFY_SOCKET");
+    pollfd notified = {listener.Get(), POLLIN, 0};
+    char message[64] = {};
+    ASSERT_EQ(poll(&notified, 1, 10000), 1) << recorder.Log();
+    EXPECT_EQ(recv(listener.Get(), message, sizeof message - 1, 0), 7);
+    EXPECT_STREQ(message, "READY=1");
+    EXPECT_EQ(access(socket.c_str(), F_OK), 0) << "ready before it listens";
+    EXPECT_EQ(korvtest::ExchangeWith(socket, kReload), "{\"success\":true}");
+    EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "a control reply was recorded";
+    const std::string live = korvtest::ExchangeWith(socket, kStatistics);
+    ASSERT_THAT(live, HasSubstr("{\"data\":"));
+    EXPECT_EQ(korvtest::ReadWholeFile(recorded), live + "\n");
+    ASSERT_EQ(unlink(recorded.c_str()), 0);
+    EXPECT_FALSE(korvtest::ExchangeWith(socket, kStatistics).empty());
+    EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "only the next reply is recorded";
+    EXPECT_EQ(recorder.Stop(SIGTERM), 0);
 
     std::ofstream(replayed) << live;
     CollectorProcess replay(KORVSNMPCD_PATH, {"--foreground", "--socket", socket, "--replay", replayed},
