@@ -100,8 +100,8 @@ TEST(KorvsnmpcdProgram, DaemonKeepsNoneOfItsCallersDescriptors)
     const std::string fds = "/proc/" + std::to_string(daemon) + "/fd/";
     EXPECT_NE(access((fds + std::to_string(kCallersPipe)).c_str(), F_OK), 0);
     std::error_code ec;
-    for (int stream : {0, 1, 2})
-        EXPECT_EQ(std::filesystem::read_symlink(fds + std::to_string(stream), ec).string(), "/dev/null") << stream;
+    for (const char *stream : {"0", "1", "2"})
+        EXPECT_EQ(std::filesystem::read_symlink(fds + stream, ec).string(), "/dev/null") << stream;
 
     ASSERT_EQ(kill(daemon, SIGTERM), 0);  // by its id, from the process id file
     EXPECT_TRUE(korvtest::Eventually([&] { return access(pidFile.c_str(), F_OK) != 0 && !Running(daemon); }))

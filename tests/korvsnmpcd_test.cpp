@@ -61,9 +61,8 @@ TEST(KorvsnmpcdParsers, MemoryInterfacesAndNfs)
     ASSERT_TRUE(korvsnmpcd::ParseMemoryInfo(
         "MemTotal: 24684096 kB\nMemFree: 24218396 kB\nMemAvailable: 24277032 kB\nBuffers: 1380 kB\n"
         "Cached: 261308 kB\nSwapCached: 9 kB\nSwapTotal: 2097148 kB\nSwapFree: 2097000 kB\n", m));
-    EXPECT_THAT(Fields({m.totalKiB, m.freeKiB, m.availableKiB, m.buffersKiB, m.cachedKiB,
-                        m.swapTotalKiB, m.swapFreeKiB}),
-                ElementsAre(24684096, 24218396, 24277032, 1380, 261308, 2097148, 2097000));
+    EXPECT_THAT(Fields({m.totalKiB, m.freeKiB, m.availableKiB, m.buffersKiB, m.cachedKiB, m.swapTotalKiB,
+                m.swapFreeKiB}), ElementsAre(24684096, 24218396, 24277032, 1380, 261308, 2097148, 2097000));
     EXPECT_FALSE(korvsnmpcd::ParseMemoryInfo("MemFree: 12 kB\n", m));
 
     auto interfaces = korvsnmpcd::ParseNetDev(
@@ -90,9 +89,8 @@ TEST(KorvsnmpcdParsers, BlockDevicesOfEveryKernelLayoutAndMountSources)
         "   8      16 short 1 2 3\n");
     ASSERT_EQ(devices.size(), 3u);
     const BlockCounters &sda = devices.at("sda");
-    EXPECT_THAT(Fields({sda.major, sda.minor, sda.reads, sda.sectorsRead, sda.writes,
-                        sda.sectorsWritten, sda.ioTicksMs}),
-                ElementsAre(8, 0, 100, 2000, 400, 8000, 900));
+    EXPECT_THAT(Fields({sda.major, sda.minor, sda.reads, sda.sectorsRead, sda.writes, sda.sectorsWritten,
+                        sda.ioTicksMs}), ElementsAre(8, 0, 100, 2000, 400, 8000, 900));
     EXPECT_THAT(Fields({devices.at("sda1").minor, devices.at("dm-0").major, devices.at("dm-0").ioTicksMs}),
                 ElementsAre(1, 253, 700));
 
