@@ -298,24 +298,22 @@ TEST(KorvsnmpcdLifecycle, SecondDaemonRefusedStaleSocketReplacedOtherFileKept)
 {
     const std::string path = TestSocketPath("life");
     unlink(path.c_str());
-    {
-        auto first = StartDaemon(path);
-        ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << first->Log();
-        // A log of its own: the first daemon may still be writing to its log.
-        auto second = StartDaemon(path, "-second");
-        EXPECT_EQ(second->WaitForExit(), 1) << second->Log();
-        EXPECT_THAT(second->Log(), HasSubstr("Another collector already answers on [" + path + "]; not starting"));
-        EXPECT_TRUE(Answers(path)) << first->Log();
-        EXPECT_EQ(first->Stop(SIGKILL), 128 + SIGKILL);  // leaves a stale socket file behind
-    }
-    {
-        auto daemon = StartDaemon(path);
-        ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << daemon->Log();
-        EXPECT_TRUE(Answers(path));
-        EXPECT_THAT(daemon->Log(), HasSubstr("Replaced the stale socket file [" + path + "]"));
-        EXPECT_EQ(daemon->Stop(SIGINT), 0);
-        EXPECT_NE(access(path.c_str(), F_OK), 0);
-    }
+    auto first = StartDaemon(path);
+    ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << first->Log();
+    // A log of its own: the first daemon may still be writing to its log.
+    auto second = StartDaemon(path, "-second");
+    EXPECT_EQ(second->WaitForExit(), 1) << second->Log();
+    EXPECT_THAT(second->Log(), HasSubstr("Another collector already answers on [" + path + "]; not starting"));
+    EXPECT_TRUE(Answers(path)) << first->Log();
+    EXPECT_EQ(first->Stop(SIGKILL), 128 + SIGKILL);  // leaves a stale socket file behind
+
+    auto daemon = StartDaemon(path);
+    ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << daemon->Log();
+    EXPECT_TRUE(Answers(path));
+    EXPECT_THAT(daemon->Log(), HasSubstr("Replaced the stale socket file [" + path + "]"));
+    EXPECT_EQ(daemon->Stop(SIGINT), 0);
+    EXPECT_NE(access(path.c_str(), F_OK), 0);
+
     std::ofstream(path) << "keep me";
     auto refused = StartDaemon(path);
     EXPECT_EQ(refused->WaitForExit(), 1);
