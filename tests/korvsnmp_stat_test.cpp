@@ -38,8 +38,7 @@ TEST(KorvsnmpStatOptions, CommandLinesThatParse)
              o.format = Format::Table, o.resources = {"cpu", "disk"}, o.watchSeconds = 0.5, o.rawNumbers = true;
          }},
         {{"--resource=nfs", "--format", "openmetrics", "--watch", "2", "--watch-count", "3"}, [](Options &o) {
-             o.format = Format::OpenMetrics, o.resources = {"nfs"}, o.watchSeconds = 2, o.watchCount = 3;
-         }},
+             o.format = Format::OpenMetrics, o.resources = {"nfs"}, o.watchSeconds = 2, o.watchCount = 3; }},
         {{"--compact"}, [](Options &o) { o.format = Format::CompactJson; }}, {{"--reload"}, [](Options &o) {
              o.action = Action::Reload; }}, {{"--version"}, [](Options &o) { o.action = Action::Version; }},
         {{"--format", "json", "--compact"}, [](Options &o) { o.format = Format::CompactJson; }},
