@@ -34,17 +34,10 @@ constexpr auto kProbeLimit = milliseconds(5000);
 constexpr auto kProbeP99Bound = milliseconds(1000);
 constexpr size_t kDescriptorSlack = 16;
 
-std::string SocketPath(const char *tag)
-{
-    return "/tmp/korvsnmpcd-crowd-" + std::to_string(getpid()) + "-" + tag + ".sock";
-}
-
 // Waits, boundedly, until `done` holds; whether it did.
-template <typename Condition>
-bool Eventually(Condition done)
+template <typename Condition> bool Eventually(Condition done)
 {
-    Clock::time_point giveUp = Clock::now() + kSettleWait;
-    while (!done() && Clock::now() < giveUp)
+    for (auto giveUp = Clock::now() + kSettleWait; !done() && Clock::now() < giveUp;)
         std::this_thread::sleep_for(milliseconds(20));
     return done();
 }
@@ -52,8 +45,7 @@ bool Eventually(Condition done)
 size_t CountLines(const std::string &text, const std::string &part)
 {
     size_t count = 0;
-    for (size_t at = text.find(part); at != std::string::npos; at = text.find(part, at + 1))
-        ++count;
+    for (size_t at = text.find(part); at != std::string::npos; at = text.find(part, at + 1)) ++count;
     return count;
 }
 
@@ -78,18 +70,11 @@ protected:
         ASSERT_TRUE(Eventually([&] { return korvtest::TimedProbe(path_, kProbeLimit).count() > 0; }));
         baseline_ = korvtest::OpenDescriptorCount(daemon_->Pid());
     }
-    void TearDown() override
-    {
-        if (daemon_) {
-            EXPECT_EQ(daemon_->Stop(SIGTERM), 0) << daemon_->Log();
-        }
-    }
-    bool BackToBaseline()
-    {
-        return Eventually([&] { return korvtest::OpenDescriptorCount(daemon_->Pid()) == baseline_; });
-    }
+    void TearDown() override { if (daemon_) { EXPECT_EQ(daemon_->Stop(SIGTERM), 0) << daemon_->Log(); } }
+    bool BackToBaseline() {
+        return Eventually([&] { return korvtest::OpenDescriptorCount(daemon_->Pid()) == baseline_; }); }
 
-    const std::string path_ = SocketPath("main");
+    const std::string path_ = "/tmp/korvsnmpcd-crowd-" + std::to_string(getpid()) + "-main.sock";
     std::optional<CollectorProcess> daemon_;
     size_t baseline_ = 0;
 };
@@ -112,23 +97,18 @@ TEST_F(KorvsnmpcdCrowd, WellFormedRequestsAreAnsweredPromptlyAmidThousandsOfHost
         size_t failures = 0;
         for (int i = 0; i < 100 && failures < 3; ++i) {
             auto took = korvtest::TimedProbe(path_, kProbeLimit);
-            if (took.count() < 0)
-                ++failures;
-            else
-                latencies.push_back(took);
+            took.count() < 0 ? void(++failures) : latencies.push_back(took);
         }
         EXPECT_EQ(failures, 0u) << "requests not answered within " << kProbeLimit.count() << " ms";
         EXPECT_LT(korvtest::Percentile(latencies, 99), kProbeP99Bound);
         EXPECT_LE(korvtest::OpenDescriptorCount(daemon_->Pid()), baseline_ + crowd + kDescriptorSlack);
-        EXPECT_TRUE(Eventually([&] { return clients.ClosedByPeer() > 0; }))
-            << "the garbage was never refused";
+        EXPECT_TRUE(Eventually([&] { return clients.ClosedByPeer() > 0; })) << "garbage never refused";
     }
     EXPECT_TRUE(BackToBaseline()) << korvtest::OpenDescriptorCount(daemon_->Pid());
 
     // Two kinds of refusal, each reported at once and then at most once per 10 s.
     auto periods = std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - start).count() / 10;
-    EXPECT_LE(CountLines(daemon_->Log(), "Refused "), static_cast<size_t>(2 * (1 + periods)))
-        << daemon_->Log();
+    EXPECT_LE(CountLines(daemon_->Log(), "Refused "), size_t(2 * (1 + periods))) << daemon_->Log();
 }
 
 TEST_F(KorvsnmpcdCrowd, AtTheCapTheOldestUnfinishedConnectionMakesRoom)
@@ -161,24 +141,13 @@ TEST(KorvsnmpcdEventThrottle, FirstAtOnceThenOneCountPerPeriod)
 {
     korvsnmpcd::EventThrottle throttle(milliseconds(10000));
     const Clock::time_point t0;
-    struct Step {
-        bool record;  // false: Due()
-        int atMs;
-        uint64_t reported;
-    } steps[] = {
-        {false, 0, 0},     // nothing happened yet
-        {true, 0, 1},      // the first one at once
-        {true, 1000, 0},   // then counted
-        {true, 2000, 0},
-        {false, 9999, 0},  // not before the period is over
-        {false, 10000, 2},
-        {false, 15000, 0},  // nothing pending
-        {true, 16000, 0},   // within the period of the last report
-        {true, 20000, 2},
-        {true, 45000, 1},   // a lone event after a quiet spell: at once
-    };
+    // {Record (else Due), at ms, reported}: nothing yet; the first at once, then counted; not before the
+    // period is over; nothing pending; within the last report's period; a lone event after a quiet spell.
+    struct Step { bool record; int atMs; uint64_t reported; } steps[] = {
+        {false, 0, 0}, {true, 0, 1}, {true, 1000, 0}, {true, 2000, 0}, {false, 9999, 0}, {false, 10000, 2},
+        {false, 15000, 0}, {true, 16000, 0}, {true, 20000, 2}, {true, 45000, 1}};
     for (const Step &step : steps) {
-        Clock::time_point now = t0 + milliseconds(step.atMs);
+        const Clock::time_point now = t0 + milliseconds(step.atMs);
         EXPECT_EQ(step.record ? throttle.Record(now) : throttle.Due(now), step.reported)
             << (step.record ? "Record" : "Due") << " at " << step.atMs << " ms";
     }

@@ -8,7 +8,7 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <climits>
+#include <filesystem>
 #include <fstream>
 #include <string>
 #include <vector>
@@ -34,19 +34,14 @@ const std::string kReload = korvproto::EncodeRequestFrame(korvtest::ParseJson("{
 std::string TestPath(const char *tag) { return "/tmp/korvsnmpcd-opt-" + std::to_string(getpid()) + "-" + tag; }
 
 // A bad argument: what is wrong, on stderr, and the usage error status.
-::testing::Matcher<std::string> Refused(const std::string &error)
-{
-    return Eq("korvsnmpcd: " + error + "\nTry 'korvsnmpcd --help'.\n");
-}
+::testing::Matcher<std::string> Refused(const std::string &error) {
+    return Eq("korvsnmpcd: " + error + "\nTry 'korvsnmpcd --help'.\n"); }
 
 TEST(KorvsnmpcdProgram, ExitStatusAndOutputOfTheCommandLine)
 {
     constexpr int kUsageError = 2;
-    const struct {
-        std::vector<std::string> args;
-        int status;
-        ::testing::Matcher<std::string> output;
-    } cases[] = {
+    const struct { std::vector<std::string> args; int status; ::testing::Matcher<std::string> output; }
+        cases[] = {
         {{"--interval", "0"}, kUsageError, Refused("--interval [0] is out of range: from 0.01 to 3600 seconds")},
         {{"--interval", "abc"}, kUsageError, Refused("--interval [abc] is not a number of seconds")},
         {{"--interval", "5000"}, kUsageError, Refused("--interval [5000] is out of range: from 0.01 to 3600 seconds")},
@@ -63,13 +58,11 @@ TEST(KorvsnmpcdProgram, ExitStatusAndOutputOfTheCommandLine)
         {{"--replay", "/nonexistent/reply.json"}, 1, Eq("")},
         {{"--foreground", "--replay", "/nonexistent/r.json"}, 1,
          HasSubstr("Cannot read the reply to replay from [/nonexistent/r.json]")},
-        {{"--probe", "--socket", "/nonexistent/k.sock"}, 1, Eq("")},  // nothing listens there
-    };
+        {{"--probe", "--socket", "/nonexistent/k.sock"}, 1, Eq("")}};  // nothing listens there
     for (const auto &c : cases) {
         // A bad argument wrongly accepted must not start a daemon on the fixed path.
-        std::vector<std::string> args = c.args;
-        if (std::none_of(args.begin(), args.end(), [](const std::string &a) { return a.rfind("--socket", 0) == 0; }))
-            args.insert(args.begin(), {"--socket", TestPath("cli.sock")});
+        std::vector<std::string> args = {"--socket", TestPath("cli.sock")};  // a later --socket wins
+        args.insert(args.end(), c.args.begin(), c.args.end());
         CollectorProcess program(KORVSNMPCD_PATH, args, TestPath("cli.log"));
         EXPECT_EQ(program.WaitForExit(), c.status) << c.args[0];
         EXPECT_THAT(program.Log(), c.output) << c.args[0];
@@ -86,20 +79,16 @@ bool Running(pid_t pid)
 TEST(KorvsnmpcdProgram, DaemonKeepsNoneOfItsCallersDescriptors)
 {
     constexpr int kCallersPipe = 251;  // as a calling script might hold one
-    const std::string socket = TestPath("daemon.sock");
-    const std::string pidFile = TestPath("daemon.pid");
+    const std::string socket = TestPath("daemon.sock"), pidFile = TestPath("daemon.pid");
     int ends[2];
     ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
     korvproto::UniqueFd readEnd(ends[0]);
-    pid_t daemon = -1;
-    {
-        CollectorProcess caller(KORVSNMPCD_PATH, {"--daemon", "--socket", socket, "--pidfile", pidFile},
-                                TestPath("daemon.log"), ends[1], kCallersPipe);
-        close(ends[1]);
-        ASSERT_EQ(caller.WaitForExit(), 0) << caller.Log();  // it returns once the daemon is ready
-        daemon = std::stoi(korvtest::ReadWholeFile(pidFile));
-        ASSERT_GT(daemon, 1);
-    }
+    CollectorProcess caller(KORVSNMPCD_PATH, {"--daemon", "--socket", socket, "--pidfile", pidFile},
+                            TestPath("daemon.log"), ends[1], kCallersPipe);
+    close(ends[1]);
+    ASSERT_EQ(caller.WaitForExit(), 0) << caller.Log();  // it returns once the daemon is ready
+    const pid_t daemon = std::stoi(korvtest::ReadWholeFile(pidFile));
+    ASSERT_GT(daemon, 1);
     EXPECT_TRUE(Running(daemon));
     EXPECT_EQ(korvtest::ExchangeWith(socket, kReload), "{\"success\":true}");
     CollectorProcess probe(KORVSNMPCD_PATH, {"--probe", "--socket", socket}, TestPath("probe.log"));
@@ -110,53 +99,44 @@ TEST(KorvsnmpcdProgram, DaemonKeepsNoneOfItsCallersDescriptors)
     EXPECT_TRUE(poll(&ended, 1, 2000) == 1 && (ended.revents & POLLHUP)) << ended.revents;
     const std::string fds = "/proc/" + std::to_string(daemon) + "/fd/";
     EXPECT_NE(access((fds + std::to_string(kCallersPipe)).c_str(), F_OK), 0);
-    for (int stream : {0, 1, 2}) {
-        char target[PATH_MAX] = {};
-        EXPECT_GT(readlink((fds + std::to_string(stream)).c_str(), target, sizeof target - 1), 0);
-        EXPECT_STREQ(target, "/dev/null") << "descriptor " << stream;
-    }
+    std::error_code ec;
+    for (const char *stream : {"0", "1", "2"})
+        EXPECT_EQ(std::filesystem::read_symlink(fds + stream, ec).string(), "/dev/null") << stream;
 
     ASSERT_EQ(kill(daemon, SIGTERM), 0);  // by its id, from the process id file
     EXPECT_TRUE(korvtest::Eventually([&] { return access(pidFile.c_str(), F_OK) != 0 && !Running(daemon); }))
         << "process id file left behind, or the daemon still runs";
-    if (Running(daemon))
-        kill(daemon, SIGKILL);  // leave nothing behind when SIGTERM did not stop it
+    if (Running(daemon)) kill(daemon, SIGKILL);  // leave nothing behind when SIGTERM did not stop it
     EXPECT_NE(access(socket.c_str(), F_OK), 0);
 }
 
 TEST(KorvsnmpcdReplay, ReadyToTheServiceManagerRecordedReplyServedAndFollowingItsFile)
 {
-    const std::string socket = TestPath("replay.sock");
-    const std::string recorded = TestPath("recorded.json");
-    const std::string manager = TestPath("notify.sock");
-    unlink(recorded.c_str());
-    unlink(manager.c_str());
+    const std::string socket = TestPath("replay.sock"), recorded = TestPath("recorded.json"),
+                      manager = TestPath("notify.sock"), replayed = TestPath("replayed.json");
+    for (const std::string &path : {recorded, manager}) unlink(path.c_str());
     korvproto::UniqueFd listener(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
     const sockaddr_un address = korvtest::SocketAddress(manager);
     ASSERT_EQ(bind(listener.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address), 0);
-    std::string live;
-    {
-        setenv("NOTIFY_SOCKET", manager.c_str(), 1);
-        CollectorProcess recorder(KORVSNMPCD_PATH, {"--socket", socket, "--record", recorded}, TestPath("record.log"));
-        unsetenv("NOTIFY_SOCKET");
-        pollfd notified = {listener.Get(), POLLIN, 0};
-        ASSERT_EQ(poll(&notified, 1, 10000), 1) << recorder.Log();
-        char message[64] = {};
-        EXPECT_EQ(recv(listener.Get(), message, sizeof message - 1, 0), 7);
-        EXPECT_STREQ(message, "READY=1");
-        EXPECT_EQ(access(socket.c_str(), F_OK), 0) << "ready before it listens";
-        EXPECT_EQ(korvtest::ExchangeWith(socket, kReload), "{\"success\":true}");
-        EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "a control reply was recorded";
-        live = korvtest::ExchangeWith(socket, kStatistics);
-        ASSERT_THAT(live, HasSubstr("{\"data\":"));
-        EXPECT_EQ(korvtest::ReadWholeFile(recorded), live + "\n");
-        ASSERT_EQ(unlink(recorded.c_str()), 0);
-        EXPECT_FALSE(korvtest::ExchangeWith(socket, kStatistics).empty());
-        EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "only the next reply is recorded";
-        EXPECT_EQ(recorder.Stop(SIGTERM), 0);
-    }
+    setenv("NOTIFY_SOCKET", manager.c_str(), 1);
+    CollectorProcess recorder(KORVSNMPCD_PATH, {"--socket", socket, "--record", recorded}, TestPath("record.log"));
+    unsetenv("NOTIFY_SOCKET");
+    pollfd notified = {listener.Get(), POLLIN, 0};
+    char message[64] = {};
+    ASSERT_EQ(poll(&notified, 1, 10000), 1) << recorder.Log();
+    EXPECT_EQ(recv(listener.Get(), message, sizeof message - 1, 0), 7);
+    EXPECT_STREQ(message, "READY=1");
+    EXPECT_EQ(access(socket.c_str(), F_OK), 0) << "ready before it listens";
+    EXPECT_EQ(korvtest::ExchangeWith(socket, kReload), "{\"success\":true}");
+    EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "a control reply was recorded";
+    const std::string live = korvtest::ExchangeWith(socket, kStatistics);
+    ASSERT_THAT(live, HasSubstr("{\"data\":"));
+    EXPECT_EQ(korvtest::ReadWholeFile(recorded), live + "\n");
+    ASSERT_EQ(unlink(recorded.c_str()), 0);
+    EXPECT_FALSE(korvtest::ExchangeWith(socket, kStatistics).empty());
+    EXPECT_NE(access(recorded.c_str(), F_OK), 0) << "only the next reply is recorded";
+    EXPECT_EQ(recorder.Stop(SIGTERM), 0);
 
-    const std::string replayed = TestPath("replayed.json");
     std::ofstream(replayed) << live;
     CollectorProcess replay(KORVSNMPCD_PATH, {"--foreground", "--socket", socket, "--replay", replayed},
                             TestPath("replay.log"));
@@ -166,8 +146,7 @@ TEST(KorvsnmpcdReplay, ReadyToTheServiceManagerRecordedReplyServedAndFollowingIt
     const struct { const char *content, *served; } changes[] = {  // served: after the change
         {"{\n  \"data\" : { \"time\" : 2 }\n}\n", "{\"data\":{\"time\":2}}"},  // compacted
         {"{\"data\":{\"time\":3}}", "{\"data\":{\"time\":3}}"},               // the same size, a later time
-        {"{\"data\":{\"time\":4}} trailing", "{\"data\":{\"time\":3}}"},      // bad: the last good one
-    };
+        {"{\"data\":{\"time\":4}} trailing", "{\"data\":{\"time\":3}}"}};    // bad: the last good one
     for (const auto &change : changes) {
         std::ofstream(replayed, std::ios::trunc) << change.content;
         // A later modification time than the last one, whatever the clock's granularity.
@@ -177,8 +156,7 @@ TEST(KorvsnmpcdReplay, ReadyToTheServiceManagerRecordedReplyServedAndFollowingIt
     }
     EXPECT_EQ(replay.Stop(SIGTERM), 0);
     EXPECT_THAT(replay.Log(), HasSubstr("[" + replayed + "] holds no JSON object to replay"));
-    unlink(replayed.c_str());
-    unlink(manager.c_str());
+    for (const std::string &path : {replayed, manager}) unlink(path.c_str());
 }
 
 }  // namespace

@@ -61,9 +61,8 @@ TEST(KorvsnmpcdParsers, MemoryInterfacesAndNfs)
     ASSERT_TRUE(korvsnmpcd::ParseMemoryInfo(
         "MemTotal: 24684096 kB\nMemFree: 24218396 kB\nMemAvailable: 24277032 kB\nBuffers: 1380 kB\n"
         "Cached: 261308 kB\nSwapCached: 9 kB\nSwapTotal: 2097148 kB\nSwapFree: 2097000 kB\n", m));
-    EXPECT_THAT(Fields({m.totalKiB, m.freeKiB, m.availableKiB, m.buffersKiB, m.cachedKiB,
-                        m.swapTotalKiB, m.swapFreeKiB}),
-                ElementsAre(24684096, 24218396, 24277032, 1380, 261308, 2097148, 2097000));
+    EXPECT_THAT(Fields({m.totalKiB, m.freeKiB, m.availableKiB, m.buffersKiB, m.cachedKiB, m.swapTotalKiB,
+                m.swapFreeKiB}), ElementsAre(24684096, 24218396, 24277032, 1380, 261308, 2097148, 2097000));
     EXPECT_FALSE(korvsnmpcd::ParseMemoryInfo("MemFree: 12 kB\n", m));
 
     auto interfaces = korvsnmpcd::ParseNetDev(
@@ -90,9 +89,8 @@ TEST(KorvsnmpcdParsers, BlockDevicesOfEveryKernelLayoutAndMountSources)
         "   8      16 short 1 2 3\n");
     ASSERT_EQ(devices.size(), 3u);
     const BlockCounters &sda = devices.at("sda");
-    EXPECT_THAT(Fields({sda.major, sda.minor, sda.reads, sda.sectorsRead, sda.writes,
-                        sda.sectorsWritten, sda.ioTicksMs}),
-                ElementsAre(8, 0, 100, 2000, 400, 8000, 900));
+    EXPECT_THAT(Fields({sda.major, sda.minor, sda.reads, sda.sectorsRead, sda.writes, sda.sectorsWritten,
+                        sda.ioTicksMs}), ElementsAre(8, 0, 100, 2000, 400, 8000, 900));
     EXPECT_THAT(Fields({devices.at("sda1").minor, devices.at("dm-0").major, devices.at("dm-0").ioTicksMs}),
                 ElementsAre(1, 253, 700));
 
@@ -106,26 +104,17 @@ TEST(KorvsnmpcdParsers, BlockDevicesOfEveryKernelLayoutAndMountSources)
 
 TEST(KorvsnmpcdRates, CounterRules)
 {
-    struct Case {
-        uint64_t before, after, elapsedMs;
-        uint32_t rate;
-    } cases[] = {
-        {100, 1100, 1000, 1000},                      // per second
-        {100, 1100, 500, 2000},                       // over half a second
-        {0, 2, 3000, 1},                              // rounded to nearest
-        {1100, 100, 1000, 0},                         // backwards: reset or wrapped
-        {4294967290u, 5, 1000, 0},                    // a 32-bit kernel counter wrapping
-        {0, 10, 0, 0},                                // no time elapsed
-        {0, 4294967296ull, 1000, kUint32Max},         // clamped to 32 bits
-        {0, 18446744073709551615ull, 1, kUint32Max},  // no overflow on the way
-    };
-    for (const Case &c : cases) {
+    struct Case { uint64_t before, after, elapsedMs; uint32_t rate; } cases[] = {
+        {100, 1100, 1000, 1000}, {100, 1100, 500, 2000},  // per second, over half a second
+        {0, 2, 3000, 1}, {1100, 100, 1000, 0},  // rounded to nearest; backwards: reset or wrapped
+        {4294967290u, 5, 1000, 0}, {0, 10, 0, 0},  // a 32-bit kernel counter wrapping; no time elapsed
+        // clamped to 32 bits; no overflow on the way
+        {0, 4294967296ull, 1000, kUint32Max}, {0, 18446744073709551615ull, 1, kUint32Max}};
+    for (const Case &c : cases)
         EXPECT_EQ(korvsnmpcd::CounterRate(c.before, c.after, c.elapsedMs), c.rate)
             << c.before << " -> " << c.after << " in " << c.elapsedMs << " ms";
-    }
-    EXPECT_EQ(korvsnmpcd::BusyPercent(1000, 1500, 1000), 50u);
-    EXPECT_EQ(korvsnmpcd::BusyPercent(1000, 3000, 1000), 100u);  // never above 100
-    EXPECT_EQ(korvsnmpcd::BusyPercent(3000, 1000, 1000), 0u);
+    auto busy = [](uint64_t before, uint64_t after) { return korvsnmpcd::BusyPercent(before, after, 1000); };
+    EXPECT_THAT(Fields({busy(1000, 1500), busy(1000, 3000), busy(3000, 1000)}), ElementsAre(50, 100, 0));
 }
 
 TEST(KorvsnmpcdRates, CpuShares)
@@ -139,10 +128,8 @@ TEST(KorvsnmpcdRates, CpuShares)
     EXPECT_EQ(korvsnmpcd::CpuPercentages(after, after).idle, 100u);
 }
 
-BlockCounters Block(unsigned minor, uint64_t reads, uint64_t sectors, uint64_t ticks = 0)
-{
-    return {8, minor, reads, sectors, reads * 2, sectors * 2, ticks};
-}
+BlockCounters Block(unsigned minor, uint64_t reads, uint64_t sectors, uint64_t ticks = 0) {
+    return {8, minor, reads, sectors, reads * 2, sectors * 2, ticks}; }
 
 TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
 {
@@ -153,8 +140,7 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
     after.blocks = {{"sda", Block(0, 30, 300, 1000)},  // steady
                     {"sdc", Block(48, 999999, 999999)},  // replaced by another device
                     {"sdd", Block(64, 500000, 500000)}};  // new
-    after.disks = {"sda", "sdc", "sdd"};
-    after.mounted = {"sda", "sdd", "sdx"};  // sdx has no counters
+    after.disks = {"sda", "sdc", "sdd"}, after.mounted = {"sda", "sdd", "sdx"};  // sdx has no counters
     after.interfaces = {{"eth0", {3000, 2000}}, {"ppp0", {123456789, 1}}};
 
     korvsnmpcd::Rates rates = korvsnmpcd::ComputeRates(before, after);
@@ -166,19 +152,18 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
                   disk == std::string("sda") ? steady : std::vector<uint64_t>(5, 0)) << disk;
     }
     ASSERT_EQ(rates.spaces.size(), 2u);  // sda and sdd
-    EXPECT_EQ(rates.spaceTotal.readByte, 100u * 512);
-    EXPECT_EQ(rates.spaceTotal.utilization, 25u);  // mean of 50 and 0
+    EXPECT_THAT(Fields({rates.spaceTotal.readByte, rates.spaceTotal.utilization}),
+                ElementsAre(100 * 512, 25));  // the mean of 50 and 0
     EXPECT_THAT(Fields({rates.interfaces.at("eth0").rx, rates.interfaces.at("eth0").tx,
                         rates.interfaces.at("ppp0").rx, rates.interfaces.count("eth1")}),
                 ElementsAre(1000, 0, 0, 0));
 
     before.blocks = {{"sda", Block(0, 0, 0)}, {"sdb", Block(16, 0, 0)}};  // totals clamp, not wrap
-    before.monotonicMs = after.monotonicMs - 1000;
+    before.monotonicMs = after.monotonicMs - 1000, after.mounted = {"sda", "sdb"};
     after.blocks = {{"sda", Block(0, 3000000000u, 0)}, {"sdb", Block(16, 3000000000u, 0)}};
-    after.mounted = {"sda", "sdb"};
     rates = korvsnmpcd::ComputeRates(before, after);
-    EXPECT_EQ(rates.spaces.at("sda").writeAccess, kUint32Max);
-    EXPECT_EQ(rates.spaceTotal.readAccess, kUint32Max);
+    EXPECT_THAT(Fields({rates.spaces.at("sda").writeAccess, rates.spaceTotal.readAccess}),
+                ElementsAre(kUint32Max, kUint32Max));
 }
 
 // ---------------------------------------------------------------- replies
@@ -186,10 +171,8 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
 TEST(KorvsnmpcdReply, StatisticsSections)
 {
     korvsnmpcd::Rates rates;
-    rates.interfaces["eth0"] = {7, 8};
-    rates.disks["sda"] = {1, 2, 3, 4, 5};
-    rates.spaces["sda1"] = {6, 7, 8, 9, 10};
-    rates.spaceTotal = {6, 7, 8, 9, 10};
+    rates.interfaces["eth0"] = {7, 8}, rates.disks["sda"] = {1, 2, 3, 4, 5};
+    rates.spaces["sda1"] = {6, 7, 8, 9, 10}, rates.spaceTotal = {6, 7, 8, 9, 10};
     Snapshot sample;
     sample.memory.totalKiB = 8000000000ull, sample.epochSeconds = 1700000000;  // memory beyond 32 bits: clamped
 
@@ -211,18 +194,14 @@ TEST(KorvsnmpcdAnswer, RequestKindsRepliesAndLog)
 {
     using korvsnmpcd::RequestKind;
     korvtest::ClearLog();
-    const struct {
-        std::string body;
-        RequestKind kind;
-    } cases[] = {
+    const struct { std::string body; RequestKind kind; } cases[] = {
         {std::string("{\"request\":\"reload\"}\n\0", 22), RequestKind::kControl},
         {"{\"reason\":\"disk swap\",\"request\":\"history_mode\"}\n", RequestKind::kControl},
         {"{\"resource\":[\"all\"]}\n", RequestKind::kStatistics}, {"{}", RequestKind::kStatistics},
         {"{\"request\":\"other\"}", RequestKind::kStatistics}, {"{\"request\":7}", RequestKind::kStatistics},
         {"garbage", RequestKind::kNotAnObject}, {"[1,2]", RequestKind::kNotAnObject}, {"7", RequestKind::kNotAnObject},
         {"", RequestKind::kNotAnObject}, {"{\"a\":", RequestKind::kNotAnObject},
-        {std::string(100000, '['), RequestKind::kNotAnObject},
-    };
+        {std::string(100000, '['), RequestKind::kNotAnObject}};
     for (const auto &c : cases)
         EXPECT_EQ(korvsnmpcd::ReadRequest(c.body), c.kind) << c.body.substr(0, 20);
     // Only the control requests log; the server counts refusals.
@@ -238,30 +217,20 @@ TEST(KorvsnmpcdAnswer, RequestKindsRepliesAndLog)
 
 constexpr auto kPrompt = std::chrono::milliseconds(400);  // well within the client timeout
 
-std::string Statistics(const std::string &path)
-{
-    Json::Value request;
-    request["resource"].append("all");
-    return korvtest::ExchangeWith(path, korvproto::EncodeRequestFrame(request));
-}
-
-bool Answers(const std::string &path)
-{
-    return korvtest::ParseJson(Statistics(path))["data"]["Memory"].isArray();
-}
-
-std::string TestSocketPath(const char *tag)
-{
-    return "/tmp/korvsnmpcd-test-" + std::to_string(getpid()) + "-" + tag + ".sock";
-}
+// The daemon's reply on `path` to the request `json`.
+std::string Ask(const std::string &path, const char *json) {
+    return korvtest::ExchangeWith(path, korvproto::EncodeRequestFrame(korvtest::ParseJson(json))); }
+std::string Statistics(const std::string &path) { return Ask(path, R"({"resource": ["all"]})"); }
+bool Answers(const std::string &path) {
+    return korvtest::ParseJson(Statistics(path))["data"]["Memory"].isArray(); }
+std::string TestSocketPath(const char *tag) {
+    return "/tmp/korvsnmpcd-test-" + std::to_string(getpid()) + "-" + tag + ".sock"; }
 
 // The built daemon on socket `path`; its output goes to a file of its own, `path` + `logTag` + ".log".
 std::unique_ptr<korvtest::CollectorProcess> StartDaemon(const std::string &path, const char *logTag = "")
 {
-    return std::make_unique<korvtest::CollectorProcess>(
-        KORVSNMPCD_PATH,
-        std::vector<std::string>{"--foreground", "--socket", path, "--interval", "0.05",
-                                 "--client-timeout", "0.6"},
+    return std::make_unique<korvtest::CollectorProcess>(KORVSNMPCD_PATH, std::vector<std::string>{
+        "--foreground", "--socket", path, "--interval", "0.05", "--client-timeout", "0.6"},
         path + logTag + ".log");
 }
 
@@ -290,7 +259,6 @@ TEST_F(KorvsnmpcdDaemon, StatisticsReplyOfThisHost)
     EXPECT_EQ(data["Memory"][0]["total_real"].asUInt(), memory.totalKiB);
     EXPECT_EQ(data["System"].size(), 1u);
     EXPECT_THAT(korvtest::JsonText(data["Network"]), HasSubstr("{\"device\":\"lo\",\"rx\":"));
-    ASSERT_GE(data["SpaceIO"].size(), 1u);
     EXPECT_EQ(data["SpaceIO"][data["SpaceIO"].size() - 1]["device"], "total");
     EXPECT_TRUE(data["iSCSI"].isArray() && data.isMember("NFS")) << data;
     const auto now = std::chrono::system_clock::now().time_since_epoch();
@@ -299,10 +267,7 @@ TEST_F(KorvsnmpcdDaemon, StatisticsReplyOfThisHost)
 
 TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDroppedAndLeavesNothingOpen)
 {
-    Json::Value history;
-    history["request"] = "history_mode";
-    history["reason"] = "nightly backup";
-    EXPECT_EQ(korvtest::ExchangeWith(path_, korvproto::EncodeRequestFrame(history)), "{\"success\":true}");
+    EXPECT_EQ(Ask(path_, R"({"request": "history_mode", "reason": "nightly backup"})"), "{\"success\":true}");
     EXPECT_THAT(daemon_->Log(), HasSubstr("History mode requested, reason: [nightly backup]"));
     const std::string garbage = korvproto::EncodeFramePrefix(8) + "garbage!";
     EXPECT_EQ(korvtest::ParseJson(korvtest::ExchangeWith(path_, garbage))["success"], false);
@@ -324,34 +289,31 @@ TEST_F(KorvsnmpcdDaemon, GarbageIsRefusedOrDroppedAndLeavesNothingOpen)
     }
     EXPECT_TRUE(Answers(path_));
     // The daemon closes the last of them as it notices that their clients left.
-    for (Clock::time_point giveUp = Clock::now() + korvtest::kProcessWait;
-         korvtest::OpenDescriptorCount(daemon_->Pid()) != descriptors && Clock::now() < giveUp;)
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    EXPECT_EQ(korvtest::OpenDescriptorCount(daemon_->Pid()), descriptors);
+    EXPECT_TRUE(korvtest::Eventually(
+        [&] { return korvtest::OpenDescriptorCount(daemon_->Pid()) == descriptors; }))
+        << korvtest::OpenDescriptorCount(daemon_->Pid()) << " open, not " << descriptors;
 }
 
 TEST(KorvsnmpcdLifecycle, SecondDaemonRefusedStaleSocketReplacedOtherFileKept)
 {
     const std::string path = TestSocketPath("life");
     unlink(path.c_str());
-    {
-        auto first = StartDaemon(path);
-        ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << first->Log();
-        // A log of its own: the first daemon may still be writing to its log.
-        auto second = StartDaemon(path, "-second");
-        EXPECT_EQ(second->WaitForExit(), 1) << second->Log();
-        EXPECT_THAT(second->Log(), HasSubstr("Another collector already answers on [" + path + "]; not starting"));
-        EXPECT_TRUE(Answers(path)) << first->Log();
-        EXPECT_EQ(first->Stop(SIGKILL), 128 + SIGKILL);  // leaves a stale socket file behind
-    }
-    {
-        auto daemon = StartDaemon(path);
-        ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << daemon->Log();
-        EXPECT_TRUE(Answers(path));
-        EXPECT_THAT(daemon->Log(), HasSubstr("Replaced the stale socket file [" + path + "]"));
-        EXPECT_EQ(daemon->Stop(SIGINT), 0);
-        EXPECT_NE(access(path.c_str(), F_OK), 0);
-    }
+    auto first = StartDaemon(path);
+    ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << first->Log();
+    // A log of its own: the first daemon may still be writing to its log.
+    auto second = StartDaemon(path, "-second");
+    EXPECT_EQ(second->WaitForExit(), 1) << second->Log();
+    EXPECT_THAT(second->Log(), HasSubstr("Another collector already answers on [" + path + "]; not starting"));
+    EXPECT_TRUE(Answers(path)) << first->Log();
+    EXPECT_EQ(first->Stop(SIGKILL), 128 + SIGKILL);  // leaves a stale socket file behind
+
+    auto daemon = StartDaemon(path);
+    ASSERT_TRUE(korvtest::WaitUntilConnectable(path)) << daemon->Log();
+    EXPECT_TRUE(Answers(path));
+    EXPECT_THAT(daemon->Log(), HasSubstr("Replaced the stale socket file [" + path + "]"));
+    EXPECT_EQ(daemon->Stop(SIGINT), 0);
+    EXPECT_NE(access(path.c_str(), F_OK), 0);
+
     std::ofstream(path) << "keep me";
     auto refused = StartDaemon(path);
     EXPECT_EQ(refused->WaitForExit(), 1);

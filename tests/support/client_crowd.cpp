@@ -48,8 +48,7 @@ std::string RequestFrame()
 }  // namespace
 
 struct ClientCrowd::Client {
-    Kind kind;
-    int fd = -1;
+    Kind kind; int fd = -1;  // -1: no connection
     size_t sent = 0;  // bytes of the request a slow client has sent on this connection
     Clock::time_point nextSend;
 };
@@ -61,21 +60,16 @@ ClientCrowd::ClientCrowd(std::string socketPath, CrowdSize size, bool reconnect)
     Clock::time_point start = Clock::now();
     std::mt19937 phases(7);
     std::uniform_int_distribution<int> phaseMs(0, static_cast<int>(kCrowdTick.count()) - 1);
-    for (auto [kind, count] : {std::pair(Kind::kIdle, size.idle), {Kind::kSlow, size.slow}, {Kind::kGarbage, size.garbage}}) {
-        for (size_t i = 0; i < count; ++i) {
+    for (auto [kind, count] : {std::pair(Kind::kIdle, size.idle), {Kind::kSlow, size.slow}, {Kind::kGarbage, size.garbage}})
+        for (size_t i = 0; i < count; ++i, connected_ += clients_.back().fd >= 0 ? 1 : 0)
             clients_.push_back({kind, ConnectNow(address), 0, start + std::chrono::milliseconds(phaseMs(phases))});
-            connected_ += clients_.back().fd >= 0 ? 1 : 0;
-        }
-    }
     driver_ = std::thread([this] { Drive(); });
 }
 
 ClientCrowd::~ClientCrowd()
 {
-    stop_ = true;
-    driver_.join();
-    for (Client &client : clients_)
-        close(client.fd);  // -1 for those closed already: harmless
+    stop_ = true, driver_.join();
+    for (Client &client : clients_) close(client.fd);  // -1 for those closed already: harmless
 }
 
 void ClientCrowd::Drive()
@@ -89,7 +83,7 @@ void ClientCrowd::Drive()
     char sink[4096];
 
     while (!stop_) {
-        Clock::time_point now = Clock::now();
+        const Clock::time_point now = Clock::now();
         for (size_t i = 0; i < clients_.size(); ++i) {
             Client &client = clients_[i];
             watched[i] = {-1, POLLIN, 0};
@@ -97,21 +91,15 @@ void ClientCrowd::Drive()
             if (due)
                 client.nextSend += kCrowdTick * ((now - client.nextSend) / kCrowdTick + 1);
             if (client.fd < 0) {
-                if (!due || !reconnect_)
-                    continue;
-                client.fd = ConnectNow(address);
-                client.sent = 0;
-                if (client.fd < 0)
+                if (!due || !reconnect_ || (client.sent = 0, client.fd = ConnectNow(address)) < 0)
                     continue;
                 ++connected_;
             } else if (due && client.kind == Kind::kSlow && client.sent < request.size()) {
-                if (send(client.fd, &request[client.sent], 1, MSG_NOSIGNAL) == 1)
-                    ++client.sent;
+                client.sent += send(client.fd, &request[client.sent], 1, MSG_NOSIGNAL) == 1;
             } else if (due && client.kind == Kind::kGarbage) {
                 char garbage[kMaxGarbageChunk];
                 size_t length = chunk(random);
-                for (size_t b = 0; b < length; ++b)
-                    garbage[b] = static_cast<char>(byte(random));
+                for (size_t b = 0; b < length; ++b) garbage[b] = static_cast<char>(byte(random));
                 (void)send(client.fd, garbage, length, MSG_NOSIGNAL);
             }
             watched[i].fd = client.fd;
@@ -120,31 +108,24 @@ void ClientCrowd::Drive()
         if (poll(watched.data(), watched.size(), kPollSliceMs) <= 0)
             continue;
         for (size_t w = 0; w < watched.size(); ++w) {
-            if (watched[w].revents == 0)
-                continue;
+            if (watched[w].revents == 0) continue;
             Client &client = clients_[w];
-            ssize_t got = read(client.fd, sink, sizeof sink);
+            const ssize_t got = read(client.fd, sink, sizeof sink);
             if (got > 0 || (got < 0 && (errno == EAGAIN || errno == EINTR)))
                 continue;  // a reply to garbage; the close follows
-            close(client.fd);
-            client.fd = -1;
-            --connected_;
-            ++closedByPeer_;
+            close(client.fd), client.fd = -1, --connected_, ++closedByPeer_;
         }
     }
 }
 
-std::chrono::microseconds TimedProbe(const std::string &socketPath,
-                                     std::chrono::milliseconds limit)
+std::chrono::microseconds TimedProbe(const std::string &socketPath, std::chrono::milliseconds limit)
 {
     const sockaddr_un address = SocketAddress(socketPath);
     const std::string request = RequestFrame();
     Clock::time_point start = Clock::now();
     int fd = ConnectNow(address);
-    while (fd < 0 && Clock::now() - start < limit) {  // the backlog is full: try again
+    for (; fd < 0 && Clock::now() - start < limit; fd = ConnectNow(address))  // the backlog is full: again
         poll(nullptr, 0, 1);
-        fd = ConnectNow(address);
-    }
     // A fresh connection's buffer takes the whole small request at once.
     bool sent = fd >= 0 && send(fd, request.data(), request.size(), MSG_NOSIGNAL) ==
                                static_cast<ssize_t>(request.size());
@@ -157,12 +138,10 @@ std::chrono::microseconds TimedProbe(const std::string &socketPath,
             continue;
         char buffer[65536];
         got = read(fd, buffer, sizeof buffer);
-        if (got > 0)
-            reply.append(buffer, static_cast<size_t>(got));
+        if (got > 0) reply.append(buffer, static_cast<size_t>(got));
         sent = got >= 0 || errno == EAGAIN;
     }
-    if (fd >= 0)
-        close(fd);
+    if (fd >= 0) close(fd);
     auto took = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - start);
     const size_t prefix = korvproto::kFramePrefixBytes;
     bool whole = got == 0 && reply.size() >= prefix &&
@@ -173,10 +152,9 @@ std::chrono::microseconds TimedProbe(const std::string &socketPath,
 
 std::chrono::microseconds Percentile(std::vector<std::chrono::microseconds> samples, double p)
 {
-    if (samples.empty())
-        return std::chrono::microseconds(0);
+    if (samples.empty()) return std::chrono::microseconds(0);
     std::sort(samples.begin(), samples.end());
-    size_t rank = static_cast<size_t>(std::ceil(p / 100.0 * static_cast<double>(samples.size())));
+    const auto rank = static_cast<size_t>(std::ceil(p / 100.0 * static_cast<double>(samples.size())));
     return samples[std::clamp<size_t>(rank, 1, samples.size()) - 1];
 }
 
