@@ -15,60 +15,31 @@ using namespace korvagentx;
 // An OID below korvObjects, as text: "6.1.3.2" is korvDiskDisplayName.2.
 std::string Below(const Oid &oid)
 {
-    const size_t skip = std::size(korvagentx::kKorvsnmpArc) + 1;
     std::string text;
-    for (size_t i = skip; i < oid.size(); ++i)
-        text += (i == skip ? "" : ".") + std::to_string(oid[i]);
-    return text;
+    for (size_t i = std::size(kKorvsnmpArc) + 1; i < oid.size(); ++i)
+        text += "." + std::to_string(oid[i]);
+    return text.erase(0, 1);
 }
 
-Oid Full(std::initializer_list<uint32_t> below)
+// A first snapshot of `result`, "below = value" per entry; texts quoted, numbers marked by their type
+// on the wire: Gauge32 and Unsigned32 (one tag) bare, Counter32 "c", Counter64 "L", INTEGER "i".
+std::vector<std::string> FirstLines(const std::string &result, const NetworkKinds &kinds = {})
 {
-    Oid oid(std::begin(korvagentx::kKorvsnmpArc), std::end(korvagentx::kKorvsnmpArc));
-    oid.push_back(korvagentx::kObjects);
-    oid.insert(oid.end(), below);
-    return oid;
-}
-
-// "below = value" per entry; texts quoted, numbers marked by their type on
-// the wire: Gauge32 and Unsigned32 (one tag) bare, Counter32 "c", Counter64 "L", INTEGER "i".
-std::vector<std::string> Lines(const Snapshot &snapshot)
-{
+    using T = ValueType;
+    TableIndexes indexes;
+    const Snapshot snapshot = BuildSnapshot(korvtest::ParseJson(result), kinds, indexes, 5, {});
     std::vector<std::string> lines;
-    for (const auto &[oid, value] : snapshot.entries) {
-        const ValueType type = value.type;
-        lines.push_back(Below(oid) + " = " +
-                        (type == ValueType::Text            ? '"' + value.text + '"'
-                         : type == ValueType::SnapshotAge   ? "age"
-                         : type == ValueType::FailedSamples ? "failed"
-                         : std::to_string(value.number) + (type == ValueType::Counter64 ? "L"
-                                                           : type == ValueType::Integer ? "i"
-                                                           : type == ValueType::Counter32 ? "c" : "")));
+    for (const auto &[oid, v] : snapshot.entries) {
+        const T t = v.type;
+        const char *tag = t == T::Counter64 ? "L" : t == T::Integer ? "i" : t == T::Counter32 ? "c" : "";
+        lines.push_back(Below(oid) + " = " + (t == T::Text ? '"' + v.text + '"' : t == T::SnapshotAge ? "age"
+            : t == T::FailedSamples ? "failed" : std::to_string(v.number) + tag));
     }
     return lines;
 }
 
-Snapshot Build(const std::string &result, TableIndexes &indexes, const NetworkKinds &kinds = {})
-{
-    return BuildSnapshot(korvtest::ParseJson(result), kinds, indexes, 5, std::chrono::steady_clock::now());
-}
-
 TEST(AgentxSnapshot, EveryKindOfObjectInOidOrderWithTypesAndClamping)
 {
-    TableIndexes indexes;
-    NetworkKinds kinds{{"bond0"}, "ppp0"};
-    Snapshot snapshot = Build(R"({
-        "cpu": {"user": 12, "idle": 88, "extra": 1}, "memory": {"memory_size": 4096, "total_real": 5000000000},
-        "nfs": {"calls": 3}, "disk": {"disk": [{"device": "sdb", "display_name": "Disk 2", "type": "ebox", "read_byte": 7},
-                          {"device": "sda", "display_name": "Disk 1", "type": "unheard-of"}],
-                 "total": {"device": "total", "utilization": 3, "read_byte": 8589934592}},
-        "network": [{"device": "total", "rx": 30, "tx": 40}, {"device": "eth0", "rx": 10},
-                    {"device": "bond0", "rx": 20}, {"device": "ppp01", "tx": 1}],
-        "space": {"volume": [{"device": "dm-0", "display_name": "Volume 1", "write_byte": 9}],
-                  "total": {"device": "total", "write_access": 6}},
-        "lun": [{"uuid": "u-1", "lun_name": "first", "read_access": 2}], "time": 1795000000})",
-                              indexes, kinds);
-
     const std::vector<std::string> expected = {
         "1.1.0 = 1795000000", "1.2.0 = age", "1.3.0 = failed", "1.4.0 = 5",
         "2.1.0 = 12", "2.4.0 = 88",                                           // cpu: "extra" has no object
@@ -81,27 +52,33 @@ TEST(AgentxSnapshot, EveryKindOfObjectInOidOrderWithTypesAndClamping)
         "7.1.4.1 = 30", "7.1.4.2 = 10", "7.1.4.3 = 20", "7.1.5.1 = 40", "7.1.5.4 = 1",
         "8.4.0 = 6L", "9.1.2.1 = \"dm-0\"", "9.1.3.1 = \"Volume 1\"", "9.1.8.1 = 9",  // volumes
         "10.1.2.1 = \"u-1\"", "10.1.3.1 = \"first\"", "10.1.5.1 = 2"};
-    EXPECT_THAT(Lines(snapshot), ::testing::ElementsAreArray(expected));
+    EXPECT_THAT(FirstLines(R"({"cpu": {"user": 12, "idle": 88, "extra": 1}, "nfs": {"calls": 3},
+        "memory": {"memory_size": 4096, "total_real": 5000000000}, "time": 1795000000, "disk": {"disk": [
+          {"device": "sdb", "display_name": "Disk 2", "type": "ebox", "read_byte": 7}, {"device": "sda",
+          "display_name": "Disk 1", "type": "unheard-of"}], "total": {"device": "total", "utilization": 3,
+          "read_byte": 8589934592}},
+        "network": [{"device": "total", "rx": 30, "tx": 40}, {"device": "eth0", "rx": 10},
+          {"device": "bond0", "rx": 20}, {"device": "ppp01", "tx": 1}],
+        "space": {"volume": [{"device": "dm-0", "display_name": "Volume 1", "write_byte": 9}],
+          "total": {"device": "total", "write_access": 6}}, "lun": [{"uuid": "u-1", "lun_name": "first",
+          "read_access": 2}]})", {{"bond0"}, "ppp0"}), ::testing::ElementsAreArray(expected));
 }
 
 TEST(AgentxSnapshot, MissingMisshapenOrUnnamedGiveNoObjectsForThemAndNeverThrow)
 {
+    std::vector<std::string> expected = {"1.2.0 = age", "1.3.0 = failed", "1.4.0 = 5"};  // the agent's own
+    for (const char *result : {"null", "[]", "\"text\"", "7",
+        R"({"cpu": [1], "memory": "x", "nfs": null, "disk": [], "network": {}, "space": 5, "lun": {"uuid": "u"}, "time": -1})",
+        R"({"disk": {"disk": {}, "total": []}, "network": [1, null, [2]], "space": {"volume": "v", "total": 3}, "lun": [1, "x"], "time": "now"})",
+        R"({"cpu": {"user": -3, "idle": 1.5, "system": "9", "nice": true, "irq": {}}})"})
+        EXPECT_THAT(FirstLines(result), ::testing::ElementsAreArray(expected)) << result;
+    // rows without a name keep their other cells; long names are cut
     const std::string longName(300, 'v');
-    const std::pair<std::string, std::vector<std::string>> cases[] = {  // result, objects beyond the agent's own
-        {"null", {}}, {"[]", {}}, {"\"text\"", {}}, {"7", {}},
-        {R"({"cpu": [1], "memory": "x", "nfs": null, "disk": [], "network": {}, "space": 5, "lun": {"uuid": "u"}, "time": -1})", {}},
-        {R"({"disk": {"disk": {}, "total": []}, "network": [1, null, [2]], "space": {"volume": "v", "total": 3}, "lun": [1, "x"], "time": "now"})", {}},
-        {R"({"cpu": {"user": -3, "idle": 1.5, "system": "9", "nice": true, "irq": {}}})", {}},
-        // rows without a name keep their other cells; long names are cut
-        {R"({"network": [{"device": 5, "rx": 1}, {"rx": 2}], "space": {"volume": [{"display_name": ")" + longName +
-             R"("}]}})", {"7.1.3.1 = 2i", "7.1.3.2 = 2i", "7.1.4.1 = 1", "7.1.4.2 = 2", "9.1.3.1 = \"" + longName.substr(0, 255) + "\""}},
-    };
-    for (const auto &[result, objects] : cases) {
-        TableIndexes indexes;
-        std::vector<std::string> expected = {"1.2.0 = age", "1.3.0 = failed", "1.4.0 = 5"};  // the agent's own
-        expected.insert(expected.end(), objects.begin(), objects.end());
-        EXPECT_THAT(Lines(Build(result, indexes)), ::testing::ElementsAreArray(expected)) << result;
-    }
+    expected.insert(expected.end(), {"7.1.3.1 = 2i", "7.1.3.2 = 2i", "7.1.4.1 = 1", "7.1.4.2 = 2",
+                                     "9.1.3.1 = \"" + longName.substr(0, 255) + "\""});
+    EXPECT_THAT(FirstLines(R"({"network": [{"device": 5, "rx": 1}, {"rx": 2}], )"
+                           R"("space": {"volume": [{"display_name": ")" + longName + R"("}]}})"),
+                ::testing::ElementsAreArray(expected));
 }
 
 TEST(AgentxSnapshot, ADeviceKeepsItsIndexWhileItIsPresentAndNeverGetsAnOldOneBack)
@@ -109,8 +86,7 @@ TEST(AgentxSnapshot, ADeviceKeepsItsIndexWhileItIsPresentAndNeverGetsAnOldOneBac
     const std::pair<std::vector<std::string>, std::vector<uint32_t>> steps[] = {  // devices, their indexes
         {{"sda", "sdb"}, {1, 2}}, {{"sdb", "sdc", "sda"}, {2, 3, 1}},  // order follows the result; indexes stay
         {{"sdc"}, {3}}, {{"sda", "sdc"}, {4, 3}},                    // sda and sdb gone; sda back: a new index
-        {{}, {}}, {{"sdc#1", "sdc#2"}, {5, 6}},  // a missing section empties the table; a device twice: two rows
-    };
+        {{}, {}}, {{"sdc#1", "sdc#2"}, {5, 6}}};  // no section: an empty table; a device twice: two rows
     RowIndexes indexes;
     for (const auto &[devices, expected] : steps)
         EXPECT_EQ(indexes.Assign(devices), expected);
@@ -118,13 +94,15 @@ TEST(AgentxSnapshot, ADeviceKeepsItsIndexWhileItIsPresentAndNeverGetsAnOldOneBac
 
 TEST(AgentxSnapshot, InstancesOfKnownObjectsTellNoSuchInstanceFromNoSuchObject)
 {
-    const std::pair<Oid, bool> cases[] = {
-        {Full({1, 4, 0}), true},      {Full({1, 5, 0}), false},     {Full({1, 1}), false},
-        {Full({1, 1, 0, 0}), false},  {Full({6, 1, 9, 77}), true},  {Full({6, 1, 1, 1}), false},
-        {Full({6, 1, 10, 1}), false}, {Full({10, 1, 8, 1}), true},  {Full({11, 1, 0}), false},
-    };
-    for (const auto &[oid, known] : cases)
+    const std::pair<Oid, bool> cases[] = {  // below korvObjects
+        {{1, 4, 0}, true}, {{1, 5, 0}, false}, {{1, 1}, false}, {{1, 1, 0, 0}, false}, {{6, 1, 9, 77}, true},
+        {{6, 1, 1, 1}, false}, {{6, 1, 10, 1}, false}, {{10, 1, 8, 1}, true}, {{11, 1, 0}, false}};
+    for (const auto &[below, known] : cases) {
+        Oid oid(std::begin(kKorvsnmpArc), std::end(kKorvsnmpArc));
+        oid.push_back(kObjects);
+        oid.insert(oid.end(), below.begin(), below.end());
         EXPECT_EQ(IsInstanceOfKnownObject(oid), known) << Below(oid);
+    }
 }
 
 TEST(AgentxOptions, CommandLines)
@@ -137,8 +115,7 @@ TEST(AgentxOptions, CommandLines)
          "--interval wants whole seconds from 1 to 86400, not \"99999999999999999999\""},
         {{"--persistent-dir", ""}, "--persistent-dir needs a non-empty value"},
         {{"--agentx-socket"}, "--agentx-socket needs a value"},
-        {{"--verbose"}, "unknown argument \"--verbose\""},
-    };
+        {{"--verbose"}, "unknown argument \"--verbose\""}};
     for (const auto &[arguments, expected] : cases) {
         Options options;
         std::string error;

@@ -30,11 +30,10 @@ namespace {
 using korvtest::Logged;
 using ::testing::Matcher;
 
-const char kUnit[] = "transmitor";
 const char kReload[] = "{\"request\":\"reload\"}";
 const std::string kReloadFrame("\x00\x00\x00\x16{\"request\":\"reload\"}\n\x00", 26);
 
-Matcher<korvtest::LogEntry> Error(const std::string &text) { return Logged(LOG_ERR, kUnit, text); }
+Matcher<korvtest::LogEntry> Error(const std::string &text) { return Logged(LOG_ERR, "transmitor", text); }
 
 struct ControlCase {
     const char *name;
@@ -44,11 +43,9 @@ struct ControlCase {
     std::vector<Matcher<korvtest::LogEntry>> messages;  // none: the request was accepted
 };
 
-ControlCase Refusal(const char *name, const std::string &reply)
-{
+ControlCase Refusal(const char *name, const std::string &reply) {
     return {name, nullptr, reply, kReloadFrame,
-            {Error(std::string("Failed to send request: [") + kReload + "], result: [" + reply + "]")}};
-}
+            {Error(std::string("Failed to send request: [") + kReload + "], result: [" + reply + "]")}}; }
 
 void PrintTo(const ControlCase &c, std::ostream *out) { *out << c.name; }
 
@@ -59,19 +56,13 @@ TEST_P(ControlRequestTest, FrameVerdictAndMessages)
     const ControlCase &c = GetParam();
     korvtest::ClearLog();
     std::optional<korvtest::TestCollector> collector;
-    if (c.reply)
-        collector.emplace().Script({korvtest::Frame(*c.reply)});
-    else
-        korvtest::NoCollector{};
-
-    EXPECT_EQ(c.reason != nullptr ? Transmitor::EnterHistoryMode(c.reason) : Transmitor::Reload(),
-              c.messages.empty());
-
+    if (c.reply) collector.emplace().Script({korvtest::Frame(*c.reply)});
+    else korvtest::NoCollector{};
+    EXPECT_EQ(c.reason ? Transmitor::EnterHistoryMode(c.reason) : Transmitor::Reload(), c.messages.empty());
     EXPECT_THAT(korvtest::LoggedMessages(), ::testing::ElementsAreArray(c.messages));
-    if (collector) {
-        ASSERT_TRUE(collector->WaitForConnections(1));
-        EXPECT_EQ(collector->Requests().at(0), c.request);
-    }
+    if (!collector) return;
+    ASSERT_TRUE(collector->WaitForConnections(1));
+    EXPECT_EQ(collector->Requests().at(0), c.request);
 }
 
 INSTANTIATE_TEST_SUITE_P(
@@ -79,8 +70,7 @@ INSTANTIATE_TEST_SUITE_P(
     ::testing::ValuesIn(std::vector<ControlCase>{
         {"Reload", nullptr, "{\"success\":true}", kReloadFrame, {}},
         {"HistoryModeReasonBeforeRequest", "test", "{\"success\":true}",
-         std::string("\x00\x00\x00\x2c{\"reason\":\"test\",\"request\":\"history_mode\"}\n\x00", 48),
-         {}},
+         std::string("\x00\x00\x00\x2c{\"reason\":\"test\",\"request\":\"history_mode\"}\n\x00", 48), {}},
         Refusal("False", "{\"success\":false}"), Refusal("NumberOne", "{\"success\":1}"),
         Refusal("StringTrue", "{\"success\":\"true\"}"), Refusal("Array", "[true]"),
         Refusal("NoSuccessMember", "{\"result\":true}"), Refusal("Scalar", "true"),
@@ -91,36 +81,28 @@ INSTANTIATE_TEST_SUITE_P(
                 "[{\"reason\":\"\",\"request\":\"history_mode\"}]")}},
         {"NoCollector", nullptr, std::nullopt, "",
          {Logged(LOG_INFO, "socket_init",
-                 "Failed to connect to socket: [/tmp/korvsnmpcd.sock], reason: "
-                 "[No such file or directory]"),
+                 "Failed to connect to socket: [/tmp/korvsnmpcd.sock], reason: [No such file or directory]"),
           Error(std::string("Failed to send request to korvsnmpcd, request: [") + kReload + "]")}}}),
     [](const auto &info) { return std::string(info.param.name); });
 
 // Binds `fd` on, or connects it to, the real collector path; 0 on success.
 int OnRealPath(int fd, bool bindIt)
 {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::strcpy(address.sun_path, korvproto::kCollectorSocketPath);
-    const auto *named = reinterpret_cast<const sockaddr *>(&address);
-    return bindIt ? bind(fd, named, sizeof address)
-                  : korvtest_connect_unredirected(fd, named, sizeof address);
+    sockaddr_un a{AF_UNIX, {}};
+    std::strcpy(a.sun_path, korvproto::kCollectorSocketPath);
+    const auto *named = reinterpret_cast<const sockaddr *>(&a);
+    return bindIt ? bind(fd, named, sizeof a) : korvtest_connect_unredirected(fd, named, sizeof a);
 }
 
 bool RealCollectorAnswers()
-{
-    return OnRealPath(korvproto::UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)).Get(),
-                      false) == 0;
-}
+{ return OnRealPath(korvproto::UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)).Get(), false) == 0; }
 
 // Runs this test program's exchange tests (korvsnmp-stat's included) in a
 // child; its exit status.
 int RunExchangeTests()
 {
-    char self[] = "/proc/self/exe";
-    char filter[] =
-        "--gtest_filter=Transmitor*:*/Transmitor*:Replies/ControlRequestTest.*:KorvsnmpStatProgram.*:"
-        "WholeRoad*";
+    char self[] = "/proc/self/exe", filter[] = "--gtest_filter=Transmitor*:*/Transmitor*:"
+        "Replies/ControlRequestTest.*:KorvsnmpStatProgram.*:WholeRoad*";
     char *argv[] = {self, filter, nullptr};
     pid_t child = -1;
     int status = 0;
@@ -137,15 +119,13 @@ TEST(RealCollectorSocket, ExchangeTestsLeaveItInPlaceAndAnswering)
     const char *path = korvproto::kCollectorSocketPath;
     korvproto::UniqueFd ours;
     struct stat before {}, after {};
-    if (lstat(path, &before) == 0) {
-        if (!RealCollectorAnswers())
-            GTEST_SKIP() << path << " exists but nothing answers there; not touching it";
-    } else {
+    if (lstat(path, &before) != 0) {
         ours = korvproto::UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
         ASSERT_EQ(OnRealPath(ours.Get(), true), 0);
         EXPECT_EQ(listen(ours.Get(), 64), 0);  // on failure too, our file is removed below
         EXPECT_EQ(lstat(path, &before), 0);
-    }
+    } else if (!RealCollectorAnswers())
+        GTEST_SKIP() << path << " exists but nothing answers there; not touching it";
 
     EXPECT_EQ(RunExchangeTests(), 0);
 

@@ -22,13 +22,7 @@ namespace {
 constexpr int kPeerWaitMs = 5000;  // a client that stalls longer has failed its test anyway
 
 // Ends the test program when the harness itself cannot work.
-void Require(bool ok, const char *what)
-{
-    if (!ok) {
-        std::perror(what);
-        std::abort();
-    }
-}
+void Require(bool ok, const char *what) { if (!ok) std::perror(what), std::abort(); }
 
 // Waits for `fd` to become readable, or for the stop pipe. False on stop,
 // error or time-out (`timeoutMs`, -1: none).
@@ -42,12 +36,9 @@ bool WaitReadable(int fd, int stopFd, int timeoutMs = kPeerWaitMs)
 bool ReadExactly(int fd, int stopFd, size_t count, std::string &into)
 {
     char buffer[4096];
-    ssize_t got = 0;
-    while (count > 0 && WaitReadable(fd, stopFd) &&
-           (got = read(fd, buffer, std::min(count, sizeof buffer))) > 0) {
-        into.append(buffer, static_cast<size_t>(got));
-        count -= static_cast<size_t>(got);
-    }
+    for (ssize_t got; count > 0 && WaitReadable(fd, stopFd) &&
+                      (got = read(fd, buffer, std::min(count, sizeof buffer))) > 0; count -= size_t(got))
+        into.append(buffer, size_t(got));
     return count == 0;
 }
 
@@ -57,10 +48,7 @@ std::string gPrivateDirectory;
 // path; the directory goes at exit.
 const bool gRedirected = [] {
     PrivateCollectorPath();
-    return std::atexit([] {
-        unlink(PrivateCollectorPath().c_str());
-        rmdir(gPrivateDirectory.c_str());
-    }) == 0;
+    return std::atexit([] { unlink(PrivateCollectorPath().c_str()), rmdir(gPrivateDirectory.c_str()); }) == 0;
 }();
 
 }  // namespace
@@ -82,8 +70,7 @@ const std::string &PrivateCollectorPath()
 std::vector<std::string> RedirectedChildVariables()
 {
     const char *sanitizer = getenv("ASAN_OPTIONS");
-    const std::string asan =
-        sanitizer != nullptr && *sanitizer != '\0' ? std::string(sanitizer) + ":" : "";
+    const std::string asan = sanitizer != nullptr && *sanitizer != '\0' ? std::string(sanitizer) + ":" : "";
     return {std::string("LD_PRELOAD=") + KORVTEST_REDIRECT_LIBRARY,
             std::string(KORVTEST_COLLECTOR_SOCKET_VARIABLE "=") + PrivateCollectorPath(),
             "ASAN_OPTIONS=" + asan + "verify_asan_link_order=0"};
@@ -95,17 +82,14 @@ std::string RedirectedChildPrefix()
     for (const std::string &variable : RedirectedChildVariables()) {
         const size_t equals = variable.find('=');
         prefix += variable.substr(0, equals + 1) + "'";  // the value single-quoted
-        for (char c : variable.substr(equals + 1))
-            prefix += c == '\'' ? std::string("'\\''") : std::string(1, c);
+        for (char c : variable.substr(equals + 1)) prefix += c == '\'' ? "'\\''" : std::string(1, c);
         prefix += "' ";
     }
     return prefix;
 }
 
 std::string FrameClaiming(uint32_t length, std::string_view body)
-{
-    return korvproto::EncodeFramePrefix(length).append(body);
-}
+{ return korvproto::EncodeFramePrefix(length).append(body); }
 
 std::string Frame(std::string_view body) { return korvproto::EncodeFrame(body); }
 
@@ -115,13 +99,11 @@ TestCollector::TestCollector()
 {
     unlink(PrivateCollectorPath().c_str());
     listenFd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
+    sockaddr_un address{AF_UNIX, {}};
     std::strncpy(address.sun_path, PrivateCollectorPath().c_str(), sizeof address.sun_path - 1);
     const auto *named = reinterpret_cast<sockaddr *>(&address);
-    Require(listenFd_ >= 0 && bind(listenFd_, named, sizeof address) == 0 &&
-                listen(listenFd_, 16) == 0 && pipe2(stopPipe_, O_CLOEXEC) == 0,
-            "starting the test collector");
+    Require(listenFd_ >= 0 && bind(listenFd_, named, sizeof address) == 0 && listen(listenFd_, 16) == 0 &&
+            pipe2(stopPipe_, O_CLOEXEC) == 0, "starting the test collector");
     server_ = std::thread(&TestCollector::Serve, this);
 }
 
@@ -129,9 +111,7 @@ TestCollector::~TestCollector()
 {
     Require(write(stopPipe_[1], "x", 1) == 1, "stopping the test collector");
     server_.join();
-    close(listenFd_);
-    close(stopPipe_[0]);
-    close(stopPipe_[1]);
+    for (int fd : {listenFd_, stopPipe_[0], stopPipe_[1]}) close(fd);
     unlink(PrivateCollectorPath().c_str());
 }
 
@@ -158,25 +138,22 @@ void TestCollector::Serve()
 {
     while (WaitReadable(listenFd_, stopPipe_[0], -1)) {
         const int connection = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
-        if (connection < 0)
-            continue;
+        if (connection < 0) continue;
         std::unique_lock<std::mutex> lock(mutex_);
         const Answer answer = script_.empty() ? Answer{} : std::move(script_.front());
-        if (!script_.empty())
-            script_.pop_front();
+        if (!script_.empty()) script_.pop_front();
         lock.unlock();
         std::string received;
         if (answer.readRequest) {
             if (ReadExactly(connection, stopPipe_[0], korvproto::kFramePrefixBytes, received))
-                ReadExactly(connection, stopPipe_[0],
-                            korvproto::DecodeFramePrefix(received.data()), received);
+                ReadExactly(connection, stopPipe_[0], korvproto::DecodeFramePrefix(received.data()),
+                            received);
             if (!answer.bytes.empty() &&
                 send(connection, answer.bytes.data(), answer.bytes.size(), MSG_NOSIGNAL) < 0)
                 std::perror("test collector send");
             char ignored[256];
             while (!answer.hangUp && WaitReadable(connection, stopPipe_[0]) &&
-                   read(connection, ignored, sizeof ignored) > 0) {
-            }
+                   read(connection, ignored, sizeof ignored) > 0) {}
         }
         close(connection);
         lock.lock();
