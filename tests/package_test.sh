@@ -21,13 +21,8 @@ cmake --install "$build" --component Unspecified --prefix "$work/unspecified" >/
 
 # contents: <package> <path> present (+) or absent (-)
 while read -r package sign path; do
-    listing=$(dpkg-deb -c "$(deb "$package")" | awk '{print $6}')
-    found=no
-    echo "$listing" | grep -qxF ".$path" && found=yes
-    case "$sign$found" in
-    +no) fail "$package lacks $path" ;;
-    -yes) fail "$package holds $path" ;;
-    esac
+    dpkg-deb -c "$(deb "$package")" | awk '{print $6}' | grep -qxF ".$path" && found=+ || found=-
+    [ "$found" = "$sign" ] || fail "$package $([ "$sign" = + ] && echo lacks || echo holds) $path"
 done <<'LIST'
 libkorvsnmp1 + /usr/lib/libkorvsnmp.so.1
 libkorvsnmp1 + /usr/lib/libkorvplatform.so.1
@@ -49,14 +44,12 @@ korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
 LIST
 
 # dependencies: on each other at the exact version, on jsoncpp from dpkg-shlibdeps
-depends() { dpkg-deb -f "$(deb "$1")" Depends; }
-for package in libkorvsnmp-dev korvsnmp-tools; do
-    depends $package | grep -q "libkorvsnmp1 (= $version)" || fail "$package: Depends: $(depends $package)"
-done
-for package in libkorvsnmp1 korvsnmp-tools; do
-    depends $package | grep -q "libjsoncpp25" || fail "$package: no shlibs dependency: $(depends $package)"
-done
-depends libkorvsnmp-dev | grep -q "libjsoncpp-dev" || fail "libkorvsnmp-dev needs libjsoncpp-dev"
+needs() { deps=$(dpkg-deb -f "$(deb "$1")" Depends); echo "$deps" | grep -q "$2" || fail "$1: $deps"; }
+needs libkorvsnmp-dev "libkorvsnmp1 (= $version)"
+needs korvsnmp-tools "libkorvsnmp1 (= $version)"
+needs libkorvsnmp1 libjsoncpp25
+needs korvsnmp-tools libjsoncpp25
+needs libkorvsnmp-dev libjsoncpp-dev
 
 # lintian: no error and no warning, but for these, with their reasons:
 #   initial-upload-closes-no-bugs: the packages go to no Debian archive.
@@ -64,9 +57,7 @@ lintian --fail-on error,warning --suppress-tags initial-upload-closes-no-bugs \
     "$work"/out/*.deb >"$work/lintian.log" 2>&1 || { cat "$work/lintian.log"; fail "lintian"; }
 
 # The unpacked programs run from the throwaway root, with its libraries.
-for package in libkorvsnmp1 korvsnmp-tools; do
-    dpkg -x "$(deb $package)" "$work/root"
-done
+for package in libkorvsnmp1 korvsnmp-tools; do dpkg -x "$(deb $package)" "$work/root"; done
 stat="$work/root/usr/bin/korvsnmp-stat"
 readelf -d "$stat" | grep -q 'R.*PATH' && fail "the packaged korvsnmp-stat has an RPATH"
 out=$(LD_LIBRARY_PATH="$work/root/usr/lib" "$stat" --version)

@@ -8,44 +8,32 @@ namespace korvtest {
 namespace {
 
 // Allocations left before the failing one, per seam; 0 when none is armed.
-thread_local long tNothrowLeft = 0;
-thread_local long tThrowingLeft = 0;
-thread_local long tAnyLeft = 0;
-thread_local bool tFailed = false;
-thread_local bool tFailedNothrow = false;
-thread_local bool tCounting = false;
-thread_local long tCount = 0;
+thread_local long tNothrowLeft = 0, tThrowingLeft = 0, tAnyLeft = 0, tCount = 0;
+thread_local bool tFailed = false, tFailedNothrow = false, tCounting = false;
 
 // Counts down an armed seam; true on its chosen allocation.
 bool Due(long &left) { return left > 0 && --left == 0; }
 
 bool FailThisAllocation(bool nothrow)
 {
-    if (tCounting)
-        ++tCount;
-    bool fail = Due(tAnyLeft);
-    fail = Due(nothrow ? tNothrowLeft : tThrowingLeft) || fail;
-    if (fail) {
-        tFailed = true;
-        tFailedNothrow = nothrow;
-    }
-    return fail;
+    tCount += tCounting ? 1 : 0;
+    const bool anyDue = Due(tAnyLeft);
+    if (!Due(nothrow ? tNothrowLeft : tThrowingLeft) && !anyDue)
+        return false;
+    tFailedNothrow = nothrow;
+    return tFailed = true;
 }
 
 void *Allocate(std::size_t size)
 {
-    if (FailThisAllocation(false))
-        throw std::bad_alloc();
-    if (void *block = std::malloc(size == 0 ? 1 : size))
-        return block;
-    throw std::bad_alloc();
+    void *block = FailThisAllocation(false) ? nullptr : std::malloc(size == 0 ? 1 : size);
+    if (block == nullptr) throw std::bad_alloc();
+    return block;
 }
 
 void *AllocateOrNull(std::size_t size) noexcept
 {
-    if (FailThisAllocation(true))
-        return nullptr;
-    return std::malloc(size == 0 ? 1 : size);
+    return FailThisAllocation(true) ? nullptr : std::malloc(size == 0 ? 1 : size);
 }
 
 }  // namespace
@@ -53,30 +41,17 @@ void *AllocateOrNull(std::size_t size) noexcept
 NothrowAllocationFailure::NothrowAllocationFailure(int nth) { tNothrowLeft = nth; }
 NothrowAllocationFailure::~NothrowAllocationFailure() { tNothrowLeft = 0; }
 
-ThrowingAllocationFailure::ThrowingAllocationFailure(int nth)
-{
-    tThrowingLeft = nth;
-    tFailed = false;
-}
+ThrowingAllocationFailure::ThrowingAllocationFailure(int nth) { tThrowingLeft = nth; tFailed = false; }
 ThrowingAllocationFailure::~ThrowingAllocationFailure() { tThrowingLeft = 0; }
 bool ThrowingAllocationFailure::Triggered() const { return tFailed; }
 
-AllocationFailure::AllocationFailure(long nth)
-{
-    tFailed = false;
-    tFailedNothrow = false;
-    tAnyLeft = nth;
-}
+AllocationFailure::AllocationFailure(long nth) { tFailed = tFailedNothrow = false; tAnyLeft = nth; }
 AllocationFailure::~AllocationFailure() { Stop(); }
 void AllocationFailure::Stop() { tAnyLeft = 0; }
 bool AllocationFailure::Failed() const { return tFailed; }
 bool AllocationFailure::FailedNothrow() const { return tFailed && tFailedNothrow; }
 
-AllocationCount::AllocationCount()
-{
-    tCount = 0;
-    tCounting = true;
-}
+AllocationCount::AllocationCount() { tCount = 0; tCounting = true; }
 AllocationCount::~AllocationCount() { Stop(); }
 void AllocationCount::Stop() { tCounting = false; }
 long AllocationCount::Count() const { return tCount; }

@@ -10,7 +10,7 @@
 
 #include <cstring>
 #include <fstream>
-#include <sstream>
+#include <iterator>
 #include <thread>
 
 #include "protocol/collector_protocol.h"
@@ -25,10 +25,8 @@ constexpr auto kRetry = std::chrono::milliseconds(10);
 bool Eventually(const std::function<bool()> &condition)
 {
     for (Clock::time_point giveUp = Clock::now() + kProcessWait; Clock::now() < giveUp;
-         std::this_thread::sleep_for(kRetry)) {
-        if (condition())
-            return true;
-    }
+         std::this_thread::sleep_for(kRetry))
+        if (condition()) return true;
     return condition();
 }
 
@@ -38,25 +36,21 @@ CollectorProcess::CollectorProcess(const std::string &program,
     : logPath_(std::move(logPath))
 {
     std::vector<char *> argv = {const_cast<char *>(program.c_str())};
-    for (const std::string &arg : args)
-        argv.push_back(const_cast<char *>(arg.c_str()));
+    for (const std::string &arg : args) argv.push_back(const_cast<char *>(arg.c_str()));
     argv.push_back(nullptr);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, logPath_.c_str(),
                                      O_WRONLY | O_CREAT | O_TRUNC, 0600);
     posix_spawn_file_actions_adddup2(&actions, STDOUT_FILENO, STDERR_FILENO);
-    if (inheritedFd >= 0)
-        posix_spawn_file_actions_adddup2(&actions, inheritedFd, inheritedAs);
-    if (posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(), environ) != 0)
-        pid_ = -1;
+    if (inheritedFd >= 0) posix_spawn_file_actions_adddup2(&actions, inheritedFd, inheritedAs);
+    if (posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(), environ) != 0) pid_ = -1;
     posix_spawn_file_actions_destroy(&actions);
 }
 
 CollectorProcess::~CollectorProcess()
 {
-    if (pid_ > 0 && kill(pid_, SIGKILL) == 0)
-        waitpid(pid_, nullptr, 0);
+    if (pid_ > 0 && kill(pid_, SIGKILL) == 0) waitpid(pid_, nullptr, 0);
     unlink(logPath_.c_str());
 }
 
@@ -71,12 +65,11 @@ int CollectorProcess::WaitForExit()
     return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
 }
 
-int CollectorProcess::Stop(int signal) { return pid_ > 0 && kill(pid_, signal) == 0 ? WaitForExit() : -1; }
+int CollectorProcess::Stop(int sig) { return pid_ > 0 && kill(pid_, sig) == 0 ? WaitForExit() : -1; }
 
 sockaddr_un SocketAddress(const std::string &path)
 {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
+    sockaddr_un address{AF_UNIX, {}};
     std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
     return address;
 }
@@ -90,37 +83,33 @@ korvproto::UniqueFd ConnectTo(const std::string &path)
     return korvproto::UniqueFd();
 }
 
-bool WaitUntilConnectable(const std::string &path)
-{
-    return Eventually([&] { return ConnectTo(path).Valid(); });
-}
+bool WaitUntilConnectable(const std::string &p) { return Eventually([&] { return ConnectTo(p).Valid(); }); }
 
 std::string ExchangeWith(const std::string &path, const std::string &frame)
 {
-    korvproto::UniqueFd connection = ConnectTo(path);
+    const korvproto::UniqueFd connection = ConnectTo(path);
+    const int fd = connection.Get();
     if (!connection.Valid() ||
-        send(connection.Get(), frame.data(), frame.size(), MSG_NOSIGNAL) != static_cast<ssize_t>(frame.size()))
+        send(fd, frame.data(), frame.size(), MSG_NOSIGNAL) != static_cast<ssize_t>(frame.size()))
         return "";
     std::string reply;
     char buffer[65536];
     ssize_t got = 1;
-    pollfd readable = {connection.Get(), POLLIN, 0};
+    pollfd readable = {fd, POLLIN, 0};
     const bool closed = Eventually([&] {  // read all there is, until the collector closes
-        while (got > 0 && poll(&readable, 1, 0) > 0 && (got = read(connection.Get(), buffer, sizeof buffer)) > 0)
+        while (got > 0 && poll(&readable, 1, 0) > 0 && (got = read(fd, buffer, sizeof buffer)) > 0)
             reply.append(buffer, static_cast<size_t>(got));
         return got <= 0;
     });
-    const size_t prefix = korvproto::kFramePrefixBytes;
-    if (!closed || reply.size() < prefix || korvproto::DecodeFramePrefix(reply.data()) != reply.size() - prefix)
-        return "";
-    return reply.substr(prefix);
+    const size_t prefix = korvproto::kFramePrefixBytes, size = reply.size();
+    const bool framed = size >= prefix && korvproto::DecodeFramePrefix(reply.data()) == size - prefix;
+    return closed && framed ? reply.substr(prefix) : "";
 }
 
 std::string ReadWholeFile(const std::string &path)
 {
-    std::ostringstream text;
-    text << std::ifstream(path, std::ios::binary).rdbuf();
-    return text.str();
+    std::ifstream in(path, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(in), {});
 }
 
 }  // namespace korvtest

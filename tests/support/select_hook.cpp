@@ -10,15 +10,14 @@ namespace korvtest {
 namespace {
 
 std::mutex gMutex;
-SelectMode gOnWrite = SelectMode::Real;
-SelectMode gOnRead = SelectMode::Real;
+SelectMode gOnWrite = SelectMode::Real, gOnRead = SelectMode::Real;
 std::vector<SelectCall> gCalls;
 
 using SelectFn = int (*)(int, fd_set *, fd_set *, fd_set *, timeval *);
 
 SelectFn RealSelect()
 {
-    static SelectFn real = reinterpret_cast<SelectFn>(dlsym(RTLD_NEXT, "select"));
+    static const auto real = reinterpret_cast<SelectFn>(dlsym(RTLD_NEXT, "select"));
     return real;
 }
 
@@ -32,11 +31,7 @@ SelectHook::SelectHook(SelectMode onWrite, SelectMode onRead)
     gCalls.clear();
 }
 
-SelectHook::~SelectHook()
-{
-    std::lock_guard<std::mutex> lock(gMutex);
-    gOnWrite = gOnRead = SelectMode::Real;
-}
+SelectHook::~SelectHook() { std::lock_guard<std::mutex> lock(gMutex); gOnWrite = gOnRead = SelectMode::Real; }
 
 std::vector<SelectCall> SelectHook::Calls() const
 {
@@ -50,14 +45,11 @@ extern "C" int select(int nfds, fd_set *readfds, fd_set *writefds, fd_set *excep
                       timeval *timeout)
 {
     using korvtest::SelectMode;
-    SelectMode mode;
-    {
-        std::lock_guard<std::mutex> lock(korvtest::gMutex);
-        korvtest::gCalls.push_back({nfds, readfds != nullptr, writefds != nullptr,
-                                    exceptfds != nullptr, timeout != nullptr,
-                                    timeout ? *timeout : timeval{}});
-        mode = writefds != nullptr ? korvtest::gOnWrite : korvtest::gOnRead;
-    }
+    std::unique_lock<std::mutex> lock(korvtest::gMutex);
+    korvtest::gCalls.push_back({nfds, readfds != nullptr, writefds != nullptr, exceptfds != nullptr,
+                                timeout != nullptr, timeout ? *timeout : timeval{}});
+    const SelectMode mode = writefds != nullptr ? korvtest::gOnWrite : korvtest::gOnRead;
+    lock.unlock();
     switch (mode) {
     case SelectMode::TimeOut:
         return 0;
@@ -66,8 +58,7 @@ extern "C" int select(int nfds, fd_set *readfds, fd_set *writefds, fd_set *excep
         return -1;
     case SelectMode::ReadyUnmarked:
         for (fd_set *set : {readfds, writefds, exceptfds})
-            if (set != nullptr)
-                FD_ZERO(set);
+            if (set != nullptr) FD_ZERO(set);
         return 1;
     case SelectMode::Real:
         break;

@@ -18,18 +18,14 @@ std::vector<LogEntry> gEntries;
 std::string ExpandErrno(const char *format, int savedErrno)
 {
     std::string expanded;
-    for (const char *p = format; *p != '\0'; ++p) {
-        if (p[0] == '%' && p[1] == '%') {
+    for (const char *p = format; *p != '\0'; ++p)
+        if (p[0] != '%' || (p[1] != '%' && p[1] != 'm'))
+            expanded += *p;
+        else if (*++p == '%')
             expanded += "%%";
-            ++p;
-        } else if (p[0] == '%' && p[1] == 'm') {
+        else
             for (const char *c = std::strerror(savedErrno); *c != '\0'; ++c)
                 expanded += (*c == '%') ? std::string("%%") : std::string(1, *c);
-            ++p;
-        } else {
-            expanded += *p;
-        }
-    }
     return expanded;
 }
 
@@ -56,26 +52,15 @@ void PrintTo(const LogEntry &entry, std::ostream *out)
     *out << "{priority " << entry.priority << ", \"" << entry.text << "\"}";
 }
 
-std::vector<LogEntry> LoggedMessages()
-{
-    std::lock_guard<std::mutex> lock(gMutex);
-    return gEntries;
-}
+std::vector<LogEntry> LoggedMessages() { std::lock_guard<std::mutex> lock(gMutex); return gEntries; }
 
-void ClearLog()
-{
-    std::lock_guard<std::mutex> lock(gMutex);
-    gEntries.clear();
-}
+void ClearLog() { std::lock_guard<std::mutex> lock(gMutex); gEntries.clear(); }
 
 }  // namespace korvtest
 
 extern "C" {
 
-void vsyslog(int priority, const char *format, va_list args)
-{
-    korvtest::Capture(priority, format, args);
-}
+void vsyslog(int priority, const char *format, va_list args) { korvtest::Capture(priority, format, args); }
 
 void syslog(int priority, const char *format, ...)
 {
