@@ -33,7 +33,7 @@ auto Fields(const Options &o) {
 TEST(KorvsnmpStatOptions, CommandLinesThatParse)
 {
     const std::pair<std::vector<std::string>, void (*)(Options &)> cases[] = {  // the defaults, changed
-        {{}, [](Options &) {}},
+        {{}, [](Options &) {}}, {{"-h"}, [](Options &o) { o.action = Action::Help; }},
         {{"--resource", "cpu,disk", "--format=table", "--watch=0.5", "--bytes"}, [](Options &o) {
              o.format = Format::Table, o.resources = {"cpu", "disk"}, o.watchSeconds = 0.5, o.rawNumbers = true;
          }},
@@ -43,11 +43,9 @@ TEST(KorvsnmpStatOptions, CommandLinesThatParse)
              o.action = Action::Reload; }}, {{"--version"}, [](Options &o) { o.action = Action::Version; }},
         {{"--format", "json", "--compact"}, [](Options &o) { o.format = Format::CompactJson; }},
         {{"--history-mode", "backup window"}, [](Options &o) {
-             o.action = Action::HistoryMode, o.reason = "backup window"; }},
-        {{"-h"}, [](Options &o) { o.action = Action::Help; }}};
+             o.action = Action::HistoryMode, o.reason = "backup window"; }}};
     for (const auto &[arguments, change] : cases) {
-        Options parsed, expected;
-        std::string error;
+        Options parsed, expected; std::string error;
         ASSERT_TRUE(ParseOptions(arguments, parsed, error)) << error;
         change(expected);
         EXPECT_EQ(Fields(parsed), Fields(expected)) << ::testing::PrintToString(arguments);
@@ -76,8 +74,7 @@ TEST(KorvsnmpStatOptions, BadCommandLinesSayWhatIsWrong)
         {{"--watch=2s"}, "--watch needs seconds from 0.1 to 86400, not \"2s\""},
         {{"--watch=1", "--watch-count=-1"}, "--watch-count needs a number of draws, not \"-1\""}};
     for (const auto &[arguments, expected] : cases) {
-        Options options;
-        std::string error;
+        Options options; std::string error;
         EXPECT_FALSE(ParseOptions(arguments, options, error)) << expected;
         EXPECT_EQ(error, expected);
     }
@@ -85,11 +82,16 @@ TEST(KorvsnmpStatOptions, BadCommandLinesSayWhatIsWrong)
 
 std::vector<std::string> Lines(const std::string &text)
 {
-    std::vector<std::string> lines;
-    std::istringstream stream(text);
+    std::vector<std::string> lines; std::istringstream stream(text);
     for (std::string line; std::getline(stream, line);) lines.push_back(line);
     return lines;
 }
+
+std::string Tables(const Json::Value &result, bool raw)
+{ std::ostringstream out; WriteTables(result, raw, out); return out.str(); }
+
+std::string OpenMetrics(const Json::Value &result)
+{ std::ostringstream out; WriteOpenMetrics(result, out); return out.str(); }
 
 // Every section in its fixed order; the counter tables of the three kinds of
 // record agree: names, then utilization, reads, writes, with units; "total"
@@ -111,10 +113,7 @@ TEST(KorvsnmpStatTables, OneColumnOrderTotalLastAndBytesOnRequest)
         "memory": {"avail_real": 1024, "avail_swap": 0, "buffer": 1, "cached": 2, "free_real": 3,
                    "memory_size": 4294967295, "total_real": 2048, "total_swap": 0},
         "time": "soon"})");
-    std::ostringstream human, raw;
-    WriteTables(result, false, human), WriteTables(result, true, raw);
-
-    EXPECT_THAT(Lines(human.str()), ElementsAre(
+    EXPECT_THAT(Lines(Tables(result, false)), ElementsAre(
         "Sample time  soon", "", "CPU", "state   share (%)", "user            8", "system          3",
         "nice            0", "idle           88", "iowait          1", "steal           0",
         "zz              1", "", "Memory", "member       size (B)", "memory_size      4.0T",
@@ -126,35 +125,29 @@ TEST(KorvsnmpStatTables, OneColumnOrderTotalLastAndBytesOnRequest)
         "sda     Disk 1        internal                7                 3             1.5K  "
         "                2                 0  x",
         "total   -             -                       7                 3             1.5K  "
-        "                2                 0  -",
-        "", "Volumes",
+        "                2                 0  -", "", "Volumes",
         "device  display_name  utilization (%)  read_access (/s)  read_byte (B/s)  write_access (/s)  "
         "write_byte (B/s)",
         "dm-0    home                        -                 -             1.0M                  -  "
         "               -",
         "total   -                           -                 -             1.0M                  -  "
-        "               -",
-        "", "iSCSI LUNs",
+        "               -", "", "iSCSI LUNs",
         "uuid  lun_name  utilization (%)  read_access (/s)  read_byte (B/s)  write_access (/s)  "
         "write_byte (B/s)",
         "6e1f  vm                      -                 -                -                  -  "
-        "            4.0G",
-        "", "NFS", "read_byte (B/s)  write_byte (B/s)  calls (/s)",
+        "            4.0G", "", "NFS", "read_byte (B/s)  write_byte (B/s)  calls (/s)",
         "           2.0K                 0          12", ""));
-    EXPECT_THAT(Lines(raw.str()), Contains("memory_size  4398046510080"));
-    EXPECT_THAT(Lines(raw.str()), Contains("           2048                 0          12"));
+    EXPECT_THAT(Lines(Tables(result, true)), Contains("memory_size  4398046510080"));
+    EXPECT_THAT(Lines(Tables(result, true)), Contains("           2048                 0          12"));
 }
 
 TEST(KorvsnmpStatTables, ValuesOfUnexpectedShapesAreShownNotThrown)
 {
-    std::ostringstream out, scalar;
-    WriteTables(korvtest::ParseJson(R"({"cpu": 3, "lun": [1, {"uuid": [2]}], "space": "none", "nfs": null,
-                   "network": {"device": "x"}, "disk": {"disk": 5, "total": true}, "time": 1e300})"),
-                false, out);
-    EXPECT_THAT(out.str(), HasSubstr("[2]"));
-    EXPECT_THAT(out.str(), HasSubstr("Sample time  1.0000000000000001e+300"));
-    WriteTables(Json::Value(5), false, scalar);
-    EXPECT_EQ(scalar.str(), "5\n");
+    const auto out = Tables(korvtest::ParseJson(R"({"cpu": 3, "lun": [1, {"uuid": [2]}], "space": "none",
+    "nfs": null, "network": {"device": "x"}, "disk": {"disk": 5, "total": true}, "time": 1e300})"), false);
+    EXPECT_THAT(out, HasSubstr("[2]"));
+    EXPECT_THAT(out, HasSubstr("Sample time  1.0000000000000001e+300"));
+    EXPECT_EQ(Tables(Json::Value(5), false), "5\n");
 }
 
 // Human bytes round like df -h; exact text scales KiB without overflow.
@@ -163,8 +156,7 @@ TEST(KorvsnmpStatTables, HumanBytesAndExactText)
     const std::pair<double, const char *> cases[] = {
         {0, "0"}, {1023, "1023"}, {1024, "1.0K"}, {1536, "1.5K"}, {10239, "10K"}, {1048063, "1023K"},
         {1048575, "1.0M"}, {1572864, "1.5M"}, {4398046510080.0, "4.0T"}, {1.2e21, "1041E"}};
-    for (const auto &[bytes, expected] : cases)
-        EXPECT_EQ(HumanBytes(bytes), expected) << bytes;
+    for (const auto &[bytes, expected] : cases) EXPECT_EQ(HumanBytes(bytes), expected) << bytes;
     const std::tuple<const char *, Unit, const char *> exact[] = {
         {"4294967295", Unit::KiB, "4398046510080"}, {"-3", Unit::KiB, "-3072"}, {"0.5", Unit::KiB, "512"},
         {"18446744073709551615", Unit::KiB, "1.888946593147858e+22"}, {"true", Unit::PerSecond, ""},
@@ -179,11 +171,10 @@ TEST(KorvsnmpStatOpenMetrics, LabelValuesAreEscapedAndValidUtf8)
         {"Disk 1", "Disk 1"}, {"say \"hi\"", "say \\\"hi\\\""},
         {"C:\\share", "C:\\\\share"}, {"two\nlines", "two\\nlines"},
         {"Datenträger 🙂", "Datenträger 🙂"}, {"latin1 \xE4!", "latin1 \xEF\xBF\xBD!"},
-        {"\xC0\xAF", "\xEF\xBF\xBD\xEF\xBF\xBD"},              // overlong '/'
-        {"\xED\xA0\x80", "\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"},  // a surrogate
-        {"cut \xE2\x82", "cut \xEF\xBF\xBD\xEF\xBF\xBD"}};  // sequence cut short
-    for (const auto &[text, expected] : cases)
-        EXPECT_EQ(EscapeLabelValue(text), expected) << text;
+        // An overlong '/', a surrogate, a sequence cut short.
+        {"\xC0\xAF", "\xEF\xBF\xBD\xEF\xBF\xBD"}, {"\xED\xA0\x80", "\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"},
+        {"cut \xE2\x82", "cut \xEF\xBF\xBD\xEF\xBF\xBD"}};
+    for (const auto &[text, expected] : cases) EXPECT_EQ(EscapeLabelValue(text), expected) << text;
 }
 
 struct Outcome { int status; std::string out, err; };
@@ -203,11 +194,9 @@ Outcome RunCommand(const std::string &command, const std::string &input = "")
 }
 
 // Runs the built korvsnmp-stat with `arguments` (shell words, then maybe more
-// of the shell's), `environment` (shell assignments) before it.
-Outcome RunStat(const std::string &arguments, const std::string &environment = "")
-{
-    return RunCommand(korvtest::RedirectedChildPrefix() + environment + " " KORVSNMP_STAT_PATH " " + arguments);
-}
+// of the shell's), `env` (shell assignments) before it.
+Outcome RunStat(const std::string &arguments, const std::string &env = "")
+{ return RunCommand(korvtest::RedirectedChildPrefix() + env + " " KORVSNMP_STAT_PATH " " + arguments); }
 
 // The samples that both Prometheus parsers read from `exposition`, as
 // "<sample> <unit> <labels> <value>"; fails the test when either parser
@@ -218,16 +207,14 @@ std::vector<std::string> ParsedSamples(const std::string &exposition)
     EXPECT_EQ(run.status, 0) << run.out << run.err << "\n" << exposition;
     std::vector<std::string> openmetrics, unitless, classic;
     for (const std::string &line : Lines(run.out)) {
-        std::istringstream words(line);
-        std::string parser, family, unit, sample, rest;
+        std::istringstream words(line); std::string parser, family, unit, sample, rest;
         std::getline(words >> parser >> family >> unit >> sample, rest);
         EXPECT_EQ(family, sample) << line;
         // The classic parser knows no units and reads every value as a float.
         (parser == "classic" ? classic : unitless).push_back(sample + rest);
         if (parser == "openmetrics") openmetrics.push_back(sample + " " + unit + rest);
     }
-    for (const std::string &sample : unitless)
-        EXPECT_THAT(classic, Contains(sample)) << "the classic parser lacks it";
+    for (const std::string &sample : unitless) EXPECT_THAT(classic, Contains(sample)) << "classic lacks it";
     return openmetrics;
 }
 
@@ -244,12 +231,10 @@ TEST(KorvsnmpStatOpenMetrics, TheParsersReadEveryNamedRecordAndNothingElse)
                   "total": {"device": "total", "write_byte": 1}},
         "lun": [{"uuid": "6e1f", "lun_name": "vm", "read_access": 4.5}],
         "nfs": {"calls": 12}, "time": 1795000000})");
-    std::ostringstream out;
-    WriteOpenMetrics(result, out);
-
+    const std::string out = OpenMetrics(result);
     const std::string sda = R"({"device": "sda", "display_name": "Disk \"1\" \\ a\nb", "type": "usb"})";
-    EXPECT_THAT(Lines(out.str()).back(), "# EOF");
-    EXPECT_THAT(ParsedSamples(out.str()), ElementsAre(
+    EXPECT_THAT(Lines(out).back(), "# EOF");
+    EXPECT_THAT(ParsedSamples(out), ElementsAre(
         "korvsnmp_memory_size_bytes bytes {} 4398046510080.0",
         "korvsnmp_memory_total_real_bytes bytes {} 2097152.0",
         R"(korvsnmp_network_receive_bytes_per_second bytes_per_second {"device": "total"} 6.0)",
@@ -269,26 +254,22 @@ TEST(KorvsnmpStatOpenMetrics, TheParsersReadEveryNamedRecordAndNothingElse)
         "korvsnmp_nfs_calls_per_second calls_per_second {} 12.0",
         "korvsnmp_sample_timestamp_seconds seconds {} 1795000000.0"));
     // A result without numbers: nothing but the end.
-    for (const char *json : {"null", "[]", R"({"cpu": [1], "disk": 3, "time": "x"})"}) {
-        std::ostringstream out;
-        WriteOpenMetrics(korvtest::ParseJson(json), out);
-        EXPECT_EQ(out.str(), "# EOF\n") << json;
-    }
+    for (const char *json : {"null", "[]", R"({"cpu": [1], "disk": 3, "time": "x"})"})
+        EXPECT_EQ(OpenMetrics(korvtest::ParseJson(json)), "# EOF\n") << json;
 }
 
 TEST(KorvsnmpStatWatch, DrawsWaitsAndStopsOnCountOrInterruption)
 {
     // {count, waits before the interruption (-1: none), draws, status}
+    // The count's draws, then interrupted.
     const std::tuple<unsigned, int, int, int> cases[] = {
-        {1, -1, 1, 7}, {3, -1, 3, 7}, {0, 4, 5, 0}, {9, 1, 2, 0}};  // count's draws, then interrupted
+        {1, -1, 1, 7}, {3, -1, 3, 7}, {0, 4, 5, 0}, {9, 1, 2, 0}};
     for (const auto &[count, waitsBeforeInterrupt, expectedDraws, expectedStatus] : cases) {
-        int draws = 0;
-        std::vector<std::chrono::milliseconds> waits;
+        int draws = 0; std::vector<std::chrono::milliseconds> waits;
         const int status = Watch(
             std::chrono::milliseconds(2500), count, [&] { return ++draws, 7; },
             [&](std::chrono::milliseconds interval) {
-                waits.push_back(interval);
-                return static_cast<int>(waits.size()) != waitsBeforeInterrupt + 1;
+                return waits.push_back(interval), static_cast<int>(waits.size()) != waitsBeforeInterrupt + 1;
             });
         EXPECT_EQ(std::make_pair(draws, status), std::make_pair(expectedDraws, expectedStatus));
         EXPECT_EQ(waits, std::vector<std::chrono::milliseconds>(
@@ -321,14 +302,12 @@ TEST(KorvsnmpStatProgram, PrintsTheAssembledResultAsJsonTablesAndOpenMetrics)
     const Outcome metrics = RunStat("--resource cpu --format openmetrics");
 
     EXPECT_EQ(json.status, 0) << json.err;
-    EXPECT_EQ(json.out,
-              "{\"cpu\":{\"idle\":88,\"user\":12},\"nfs\":{\"read_byte\":5},\"time\":1795000000}\n");
+    EXPECT_EQ(json.out, R"({"cpu":{"idle":88,"user":12},"nfs":{"read_byte":5},"time":1795000000})" "\n");
     EXPECT_EQ(table.status, 0) << table.err;
-    EXPECT_THAT(Lines(table.out),
-                ElementsAre("Sample time  2026-11-18T07:36:40-03:30", "", "CPU", "state  share (%)",
-                            "user          12", "idle          88", "", "NFS",
-                            "read_byte (B/s)  write_byte (B/s)  calls (/s)",
-                            "              5                 -           -", ""));
+    EXPECT_THAT(Lines(table.out), ElementsAre("Sample time  2026-11-18T07:36:40-03:30", "", "CPU",
+                "state  share (%)", "user          12", "idle          88", "", "NFS",
+                "read_byte (B/s)  write_byte (B/s)  calls (/s)",
+                "              5                 -           -", ""));
     EXPECT_EQ(metrics.status, 0) << metrics.err;
     EXPECT_THAT(ParsedSamples(metrics.out),
                 ElementsAre("korvsnmp_cpu_user_percent percent {} 12.0",
@@ -363,8 +342,7 @@ TEST(KorvsnmpStatProgram, BadCommandLineExitsWithUsageAndVersionAnswers)
 // wait has begun once SIGTERM (bit 14 of /proc/PID/status SigBlk) is blocked.
 TEST(KorvsnmpStatProgram, WatchRedrawsUntilInterrupted)
 {
-    korvtest::TestCollector collector;
-    collector.Script({korvtest::Frame(kCpuAndNfsReply)});
+    korvtest::TestCollector collector; collector.Script({korvtest::Frame(kCpuAndNfsReply)});
     const Outcome run = RunStat("--watch 3600 --resource nfs --compact & p=$!; for i in $(seq 1000); do "
                             "[ $((0x$(sed -n 's/^SigBlk:\\s*//p' /proc/$p/status) >> 14 & 1)) = 1 ] && break; "
                             "sleep 0.005; done; kill -TERM $p; wait $p");

@@ -8,7 +8,6 @@
 #include <chrono>
 #include <optional>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gmock/gmock.h>
@@ -23,24 +22,16 @@ namespace {
 using korvtest::ClientCrowd;
 using korvtest::CollectorProcess;
 using korvtest::CrowdSize;
+using korvtest::Eventually;
 using ::testing::HasSubstr;
 using Clock = std::chrono::steady_clock;
 using std::chrono::milliseconds;
 
-constexpr auto kSettleWait = std::chrono::seconds(10);
 constexpr auto kProbeLimit = milliseconds(5000);
 // Generous for a loaded two-core machine and the sanitizer build; a daemon
 // that leaves requests in the backlog behind the crowd takes seconds.
 constexpr auto kProbeP99Bound = milliseconds(1000);
 constexpr size_t kDescriptorSlack = 16;
-
-// Waits, boundedly, until `done` holds; whether it did.
-template <typename Condition> bool Eventually(Condition done)
-{
-    for (auto giveUp = Clock::now() + kSettleWait; !done() && Clock::now() < giveUp;)
-        std::this_thread::sleep_for(milliseconds(20));
-    return done();
-}
 
 size_t CountLines(const std::string &text, const std::string &part)
 {
@@ -53,8 +44,7 @@ size_t CountLines(const std::string &text, const std::string &part)
 bool RoomForDescriptors(rlim_t wanted)
 {
     rlimit limit;
-    if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_max < wanted)
-        return false;
+    if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_max < wanted) return false;
     limit.rlim_cur = std::max(limit.rlim_cur, wanted);
     return setrlimit(RLIMIT_NOFILE, &limit) == 0;
 }
@@ -83,8 +73,7 @@ TEST_F(KorvsnmpcdCrowd, WellFormedRequestsAreAnsweredPromptlyAmidThousandsOfHost
 {
     const CrowdSize size{2000, 100, 200};
     const size_t crowd = size.idle + size.slow + size.garbage;
-    if (!RoomForDescriptors(crowd + 256))
-        GTEST_SKIP() << "the descriptor limit is below " << crowd + 256;
+    if (!RoomForDescriptors(crowd + 256)) GTEST_SKIP() << "the descriptor limit is below " << crowd + 256;
     Start({"--client-timeout", "60"});  // the crowd stays connected for the whole test
     Clock::time_point start = Clock::now();
     {
@@ -146,11 +135,10 @@ TEST(KorvsnmpcdEventThrottle, FirstAtOnceThenOneCountPerPeriod)
     struct Step { bool record; int atMs; uint64_t reported; } steps[] = {
         {false, 0, 0}, {true, 0, 1}, {true, 1000, 0}, {true, 2000, 0}, {false, 9999, 0}, {false, 10000, 2},
         {false, 15000, 0}, {true, 16000, 0}, {true, 20000, 2}, {true, 45000, 1}};
-    for (const Step &step : steps) {
-        const Clock::time_point now = t0 + milliseconds(step.atMs);
-        EXPECT_EQ(step.record ? throttle.Record(now) : throttle.Due(now), step.reported)
+    for (const Step &step : steps)
+        EXPECT_EQ(step.record ? throttle.Record(t0 + milliseconds(step.atMs))
+                              : throttle.Due(t0 + milliseconds(step.atMs)), step.reported)
             << (step.record ? "Record" : "Due") << " at " << step.atMs << " ms";
-    }
 }
 
 }  // namespace

@@ -31,18 +31,18 @@ constexpr int kPollSliceMs = 10;
 enum class Kind { kIdle, kSlow, kGarbage };
 
 // A non-blocking connection, or -1 (the backlog is full, or no listener).
-int ConnectNow(const sockaddr_un &address)
+int ConnectNow(const std::string &path)
 {
+    const sockaddr_un address = SocketAddress(path);
     korvproto::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
-    bool connected = fd.Valid() && connect(fd.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) == 0;
-    return connected ? fd.Release() : -1;
+    return fd.Valid() && connect(fd.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) == 0
+        ? fd.Release() : -1;
 }
 
 std::string RequestFrame()
 {
     Json::Value request;
-    request["resource"].append("all");
-    return korvproto::EncodeRequestFrame(request);
+    return request["resource"].append("all"), korvproto::EncodeRequestFrame(request);
 }
 
 }  // namespace
@@ -56,13 +56,13 @@ struct ClientCrowd::Client {
 ClientCrowd::ClientCrowd(std::string socketPath, CrowdSize size, bool reconnect)
     : path_(std::move(socketPath)), reconnect_(reconnect)
 {
-    const sockaddr_un address = SocketAddress(path_);
-    Clock::time_point start = Clock::now();
+    const Clock::time_point start = Clock::now();
     std::mt19937 phases(7);
-    std::uniform_int_distribution<int> phaseMs(0, static_cast<int>(kCrowdTick.count()) - 1);
-    for (auto [kind, count] : {std::pair(Kind::kIdle, size.idle), {Kind::kSlow, size.slow}, {Kind::kGarbage, size.garbage}})
+    std::uniform_int_distribution<Clock::rep> phase(0, Clock::duration(kCrowdTick).count() - 1);
+    for (auto [kind, count] :
+         {std::pair(Kind::kIdle, size.idle), {Kind::kSlow, size.slow}, {Kind::kGarbage, size.garbage}})
         for (size_t i = 0; i < count; ++i, connected_ += clients_.back().fd >= 0 ? 1 : 0)
-            clients_.push_back({kind, ConnectNow(address), 0, start + std::chrono::milliseconds(phaseMs(phases))});
+            clients_.push_back({kind, ConnectNow(path_), 0, start + Clock::duration(phase(phases))});
     driver_ = std::thread([this] { Drive(); });
 }
 
@@ -74,7 +74,6 @@ ClientCrowd::~ClientCrowd()
 
 void ClientCrowd::Drive()
 {
-    const sockaddr_un address = SocketAddress(path_);
     const std::string request = RequestFrame();
     std::mt19937 random(11);
     std::uniform_int_distribution<int> byte(0, 255);
@@ -86,33 +85,27 @@ void ClientCrowd::Drive()
         const Clock::time_point now = Clock::now();
         for (size_t i = 0; i < clients_.size(); ++i) {
             Client &client = clients_[i];
-            watched[i] = {-1, POLLIN, 0};
             bool due = now >= client.nextSend;
-            if (due)
-                client.nextSend += kCrowdTick * ((now - client.nextSend) / kCrowdTick + 1);
+            if (due) client.nextSend += kCrowdTick * ((now - client.nextSend) / kCrowdTick + 1);
             if (client.fd < 0) {
-                if (!due || !reconnect_ || (client.sent = 0, client.fd = ConnectNow(address)) < 0)
-                    continue;
-                ++connected_;
+                if (due && reconnect_ && (client.sent = 0, client.fd = ConnectNow(path_)) >= 0) ++connected_;
             } else if (due && client.kind == Kind::kSlow && client.sent < request.size()) {
                 client.sent += send(client.fd, &request[client.sent], 1, MSG_NOSIGNAL) == 1;
             } else if (due && client.kind == Kind::kGarbage) {
                 char garbage[kMaxGarbageChunk];
-                size_t length = chunk(random);
-                for (size_t b = 0; b < length; ++b) garbage[b] = static_cast<char>(byte(random));
+                const size_t length = chunk(random);
+                std::generate_n(garbage, length, [&] { return static_cast<char>(byte(random)); });
                 (void)send(client.fd, garbage, length, MSG_NOSIGNAL);
             }
-            watched[i].fd = client.fd;
+            watched[i] = {client.fd, POLLIN, 0};
         }
 
-        if (poll(watched.data(), watched.size(), kPollSliceMs) <= 0)
-            continue;
+        if (poll(watched.data(), watched.size(), kPollSliceMs) <= 0) continue;
         for (size_t w = 0; w < watched.size(); ++w) {
             if (watched[w].revents == 0) continue;
             Client &client = clients_[w];
             const ssize_t got = read(client.fd, sink, sizeof sink);
-            if (got > 0 || (got < 0 && (errno == EAGAIN || errno == EINTR)))
-                continue;  // a reply to garbage; the close follows
+            if (got > 0 || (got < 0 && (errno == EAGAIN || errno == EINTR))) continue;  // a reply to garbage
             close(client.fd), client.fd = -1, --connected_, ++closedByPeer_;
         }
     }
@@ -120,12 +113,11 @@ void ClientCrowd::Drive()
 
 std::chrono::microseconds TimedProbe(const std::string &socketPath, std::chrono::milliseconds limit)
 {
-    const sockaddr_un address = SocketAddress(socketPath);
     const std::string request = RequestFrame();
-    Clock::time_point start = Clock::now();
-    int fd = ConnectNow(address);
-    for (; fd < 0 && Clock::now() - start < limit; fd = ConnectNow(address))  // the backlog is full: again
-        poll(nullptr, 0, 1);
+    const Clock::time_point start = Clock::now();
+    int fd = ConnectNow(socketPath);
+    // The backlog is full: again.
+    for (; fd < 0 && Clock::now() - start < limit; fd = ConnectNow(socketPath)) poll(nullptr, 0, 1);
     // A fresh connection's buffer takes the whole small request at once.
     bool sent = fd >= 0 && send(fd, request.data(), request.size(), MSG_NOSIGNAL) ==
                                static_cast<ssize_t>(request.size());
@@ -134,8 +126,7 @@ std::chrono::microseconds TimedProbe(const std::string &socketPath, std::chrono:
     while (got != 0 && sent && Clock::now() - start < limit) {
         pollfd ready = {fd, POLLIN, 0};
         auto left = std::chrono::ceil<std::chrono::milliseconds>(limit - (Clock::now() - start));
-        if (poll(&ready, 1, static_cast<int>(std::max<long>(left.count(), 0))) <= 0)
-            continue;
+        if (poll(&ready, 1, static_cast<int>(std::max<long>(left.count(), 0))) <= 0) continue;
         char buffer[65536];
         got = read(fd, buffer, sizeof buffer);
         if (got > 0) reply.append(buffer, static_cast<size_t>(got));
@@ -144,10 +135,9 @@ std::chrono::microseconds TimedProbe(const std::string &socketPath, std::chrono:
     if (fd >= 0) close(fd);
     auto took = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - start);
     const size_t prefix = korvproto::kFramePrefixBytes;
-    bool whole = got == 0 && reply.size() >= prefix &&
-                 korvproto::DecodeFramePrefix(reply.data()) == reply.size() - prefix &&
-                 reply.compare(prefix, 8, "{\"data\":") == 0;
-    return whole ? took : std::chrono::microseconds(-1);
+    return got == 0 && reply.size() >= prefix
+        && korvproto::DecodeFramePrefix(reply.data()) == reply.size() - prefix
+        && reply.compare(prefix, 8, "{\"data\":") == 0 ? took : std::chrono::microseconds(-1);
 }
 
 std::chrono::microseconds Percentile(std::vector<std::chrono::microseconds> samples, double p)

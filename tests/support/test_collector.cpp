@@ -58,8 +58,7 @@ const std::string &PrivateCollectorPath()
     static const std::string path = [] {
         char directory[] = "/tmp/korvtest-XXXXXX";
         Require(mkdtemp(directory) != nullptr, "making the private collector directory");
-        gPrivateDirectory = directory;
-        const std::string socket = gPrivateDirectory + "/korvsnmpcd.sock";
+        const std::string socket = (gPrivateDirectory = directory) + "/korvsnmpcd.sock";
         Require(setenv(KORVTEST_COLLECTOR_SOCKET_VARIABLE, socket.c_str(), 1) == 0,
                 "setting " KORVTEST_COLLECTOR_SOCKET_VARIABLE);
         return socket;
@@ -116,16 +115,10 @@ TestCollector::~TestCollector()
 }
 
 void TestCollector::Script(Answer answer)
-{
-    std::lock_guard<std::mutex> lock(mutex_);
-    script_.push_back(std::move(answer));
-}
+{ std::lock_guard lock(mutex_); script_.push_back(std::move(answer)); }
 
 std::vector<std::string> TestCollector::Requests() const
-{
-    std::lock_guard<std::mutex> lock(mutex_);
-    return requests_;
-}
+{ std::lock_guard lock(mutex_); return requests_; }
 
 bool TestCollector::WaitForConnections(size_t count) const
 {
@@ -137,25 +130,23 @@ bool TestCollector::WaitForConnections(size_t count) const
 void TestCollector::Serve()
 {
     while (WaitReadable(listenFd_, stopPipe_[0], -1)) {
-        const int connection = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
-        if (connection < 0) continue;
+        const int fd = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
+        if (fd < 0) continue;
         std::unique_lock<std::mutex> lock(mutex_);
         const Answer answer = script_.empty() ? Answer{} : std::move(script_.front());
         if (!script_.empty()) script_.pop_front();
         lock.unlock();
         std::string received;
         if (answer.readRequest) {
-            if (ReadExactly(connection, stopPipe_[0], korvproto::kFramePrefixBytes, received))
-                ReadExactly(connection, stopPipe_[0], korvproto::DecodeFramePrefix(received.data()),
-                            received);
-            if (!answer.bytes.empty() &&
-                send(connection, answer.bytes.data(), answer.bytes.size(), MSG_NOSIGNAL) < 0)
+            if (ReadExactly(fd, stopPipe_[0], korvproto::kFramePrefixBytes, received))
+                ReadExactly(fd, stopPipe_[0], korvproto::DecodeFramePrefix(received.data()), received);
+            if (!answer.bytes.empty() && send(fd, answer.bytes.data(), answer.bytes.size(), MSG_NOSIGNAL) < 0)
                 std::perror("test collector send");
             char ignored[256];
-            while (!answer.hangUp && WaitReadable(connection, stopPipe_[0]) &&
-                   read(connection, ignored, sizeof ignored) > 0) {}
+            while (!answer.hangUp && WaitReadable(fd, stopPipe_[0]) &&
+                   read(fd, ignored, sizeof ignored) > 0) {}
         }
-        close(connection);
+        close(fd);
         lock.lock();
         requests_.push_back(std::move(received));
         changed_.notify_all();
