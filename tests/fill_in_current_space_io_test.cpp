@@ -61,9 +61,9 @@ TEST_F(SpaceIOTest, UnreadableInputFailsUntouchedAndEmptyInputGivesNoVolumes)
         EXPECT_EQ(Fill(Parse(c.spaceIO), false), Parse(R"({"earlier": 1})"));
         EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
     }
-    korvtest::ClearLog();  // an empty section gives an empty volume list
+    // An empty section gives an empty volume list.
+    korvtest::ClearLog(); Json::Value notAnObject = "x";
     EXPECT_EQ(Fill(Json::Value(Json::arrayValue)), Parse(R"({"earlier": 1, "volume": []})"));
-    Json::Value notAnObject = "x";
     EXPECT_TRUE(KORVSNMP::FillInCurrentSpaceIO(Parse(R"([{"device": "total"}])"), notAnObject));
     EXPECT_EQ(notAnObject, Parse(R"({"volume": [], "total": {"device": "total"}})"));
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
@@ -152,15 +152,13 @@ TEST_F(SpaceIONodeTest, UnresolvedNodesAndCaches)
 // its own, with one long link.
 TEST_F(SpaceIONodeTest, OverlongLinkTargetIsCutAndTerminated)
 {
-    constexpr int kRefused = 77;
     const std::string target = "../" + std::string(1000, 'd') + "/abcdefghijklmnopqrstuvwxyz0123456789";
     const std::string key = target.substr(0, 1023).substr(1004);
-    korvstandin::Host().spaces = {{Node(0), "long link"}};
+    constexpr int kRefused = 77; korvstandin::Host().spaces = {{Node(0), "long link"}};
     const std::string link = std::string(kSysBlock) + "/" + std::to_string(nodes_.Device(0).major) +
                              ":" + std::to_string(nodes_.Device(0).minor);
 
-    pid_t child = fork();
-    ASSERT_NE(child, -1) << std::strerror(errno);
+    pid_t child = fork(); ASSERT_NE(child, -1) << std::strerror(errno);
     if (child == 0) {
         if (unshare(CLONE_NEWNS) != 0 || mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
             mount("tmpfs", kSysBlock, "tmpfs", 0, nullptr) != 0 || symlink(target.c_str(), link.c_str()) != 0)
