@@ -55,11 +55,9 @@ TEST_F(DiskIOTest, ExpansionUnitDiskNamesItsFirstPoweredListingUnit)
         {"Korvel-X5", false, "sdc=Disk 3 (Expansion Unit)/ebox"},
         {std::nullopt, true, "sdc=Disk 3 (Expansion Unit)/ebox"},
         // Cut to 31 characters before the prefix is dropped.
-        {"Korvel-ABCDEFGHIJKLMNOPQRSTUVWXYZ", true, "sdc=Disk 3 (ABCDEFGHIJKLMNOPQRSTUVWX)/ebox"},
-    };
+        {"Korvel-ABCDEFGHIJKLMNOPQRSTUVWXYZ", true, "sdc=Disk 3 (ABCDEFGHIJKLMNOPQRSTUVWX)/ebox"}};
     for (const auto &c : cases) {
-        SCOPED_TRACE(c.name);
-        korvtest::FreshPlatform();
+        korvtest::FreshPlatform(); SCOPED_TRACE(c.name);
         Host().disks = {{3, DISK_CONTAINER_EBOX, 0, "/dev/sdc"}};
         AddUnit(2, {"/dev/sdc"}, c.model, c.powered);
         EXPECT_THAT(Names({"sdc"}), ElementsAre(c.name));
@@ -197,11 +195,9 @@ TEST_F(DiskIOTest, BadInputFailsWithOutputUntouched)
         {R"([{"device": "sda"}, {"device": 7}])", R"(DiskIO element 1: "device" is not a string)"},
         {R"([{"device": "sda"}, {"device": "sda", "write_byte": -1}])", number("write_byte")},
         {R"([{"device": "sda"}, {"device": "sda", "read_access": 4294967296}])", number("read_access")},
-        {R"([{"device": "sda"}, {"device": "sda", "utilization": "5"}])", number("utilization")},
-    };
+        {R"([{"device": "sda"}, {"device": "sda", "utilization": "5"}])", number("utilization")}};
     for (const auto &c : cases) {
-        SCOPED_TRACE(c.diskIO);
-        korvtest::ClearLog();
+        korvtest::ClearLog(); SCOPED_TRACE(c.diskIO);
         Json::Value out = ParseJson(R"({"keep": 1})");
         EXPECT_FALSE(KORVSNMP::FillInCurrentDiskIO(ParseJson(c.diskIO), out));
         EXPECT_EQ(JsonText(out), Canonical(R"({"keep": 1})"));

@@ -51,10 +51,9 @@ TEST_F(NetworkTest, InterfacesComeInByteOrderAfterTheTotal)
 // group, uncounted.
 TEST_F(NetworkTest, AggregationIsSummedFromItsMembersOnlyAndPppoeFollows)
 {
-    Host().pppoeInterface = "ppp0";
     Host().interfaces = {{"eth0"}, Aggregation("bond0", {"eth0", "eth1"}), {"eth1"},
                          Aggregation("bond1", {"eth7", "eth8"}), Aggregation("bond2", {"eth0", "eth1", "eth2"})};
-    Host().interfaces[4].memberCountClaim = 0;
+    Host().interfaces[4].memberCountClaim = 0, Host().pppoeInterface = "ppp0";
     EXPECT_EQ(Fill(R"([{"device": "bond0", "rx": 500, "tx": 500}, {"device": "eth0", "rx": 4294967295, "tx": 20},
                        {"device": "eth1", "rx": 2, "tx": 2}, {"device": "bond2", "rx": 9},
                        {"device": "ppp01", "rx": 7}, {"device": "pp0", "rx": 8}, {"device": 5}, null,
@@ -67,8 +66,8 @@ TEST_F(NetworkTest, AggregationIsSummedFromItsMembersOnlyAndPppoeFollows)
 TEST_F(NetworkTest, AggregationMembersAreReadFromAtMostThirtyTwoSlots)
 {
     Host().interfaces = {Aggregation("bond0", {"eth0", "eth1"}), Aggregation("bond1", {"eth0"})};
-    Host().interfaces[0].memberCountClaim = 40;  // slots 2 to 31 hold empty names
-    Host().interfaces[1].memberCountClaim = -3;
+    // Slots 2 to 31 hold empty names.
+    Host().interfaces[0].memberCountClaim = 40, Host().interfaces[1].memberCountClaim = -3;
     EXPECT_EQ(Fill(R"([{"device": "eth0", "rx": 1, "tx": 1}, {"device": "eth1", "rx": 2, "tx": 2},
                        {"device": "", "rx": 100, "tx": 100}])"),
               Canonical(R"([{"device": "total", "rx": 3003, "tx": 3003}, {"device": "bond0", "rx": 3003, "tx": 3003}])"));
@@ -78,8 +77,8 @@ TEST_F(NetworkTest, EachKindOfInterfaceIsListedByItsOwnRule)
 {
     Host().interfaces = {{"dkos0"}, {"dko"}, Vlan("eth0.5", "dkos5"), {"ovs_eth3", NetRole::OvsMaster},
                          {"ovs1", NetRole::OvsMaster}, {"ab", NetRole::OvsMaster}, {"eth4"}};
-    Host().interfaces[4].ovsMasterAnswer = -7;  // any answer but 0 and 2
-    Host().interfaces[6].vlanQueryFails = true;
+    // The second OVS master gives any answer but 0 and 2.
+    Host().interfaces[4].ovsMasterAnswer = -7, Host().interfaces[6].vlanQueryFails = true;
     EXPECT_EQ(Fill(R"([{"device": "dkos0"}, {"device": "dko"}, {"device": "dkos5"}, {"device": "eth3"},
                        {"device": "", "rx": 1}, {"device": "eth4"}])"),
               Canonical(R"([{"device": "total", "rx": 2, "tx": 0}, {"device": "", "rx": 1}, {"device": "", "rx": 1},
@@ -98,8 +97,7 @@ TEST_F(NetworkTest, VlanRecordIsZeroedOncePerCallNotPerInterface)
 
 TEST_F(NetworkTest, EmptySectionGivesTheZeroTotalAndNoInterfaceTheBareOne)
 {
-    Host().interfaces = {{"eth0"}};
-    korvstandin::SetJournal(true);
+    Host().interfaces = {{"eth0"}}; korvstandin::SetJournal(true);
     EXPECT_EQ(Fill("[]"), Canonical(R"([{"device": "total", "rx": 0, "tx": 0}])"));
     EXPECT_THAT(korvstandin::Journal(), ElementsAre("KLIBNetGetInterfaceInfo(32, 6)", "KLIBNetVlanGet(eth0)",
                                                     "KLIBNetOVSIfIsMaster(eth0)", "KORVPPPoeIntfGet(16)"));
@@ -120,11 +118,9 @@ TEST_F(NetworkTest, UnreadableInputFailsAndLeavesTheOutputUntouched)
         {R"([{"device": "eth0"}, 3])", "Network element 1 is not an object"},
         {R"([{"device": "eth0", "rx": -1}])", number("eth0", "rx")},
         {R"([{"device": "eth0", "tx": 4294967296}])", number("eth0", "tx")},
-        {R"([{"device": "eth1", "rx": "12"}])", number("eth1", "rx")},
-    };
+        {R"([{"device": "eth1", "rx": "12"}])", number("eth1", "rx")}};
     for (const auto &bad : cases) {
-        SCOPED_TRACE(bad.network);
-        korvtest::ClearLog();
+        korvtest::ClearLog(); SCOPED_TRACE(bad.network);
         EXPECT_EQ(Fill(bad.network, false), Canonical(R"("earlier")"));
         EXPECT_THAT(LoggedMessages(), ElementsAre(Logged(LOG_ERR, kUnit, bad.message)));
     }

@@ -30,7 +30,7 @@
 
 namespace {
 
-using ::testing::IsEmpty;
+using ::testing::ElementsAre, ::testing::IsEmpty;
 
 constexpr char kUnit[] = "fill_in_current_space_io";
 constexpr char kSysBlock[] = "/sys/dev/block";
@@ -55,18 +55,15 @@ TEST_F(SpaceIOTest, UnreadableInputFailsUntouchedAndEmptyInputGivesNoVolumes)
         {R"({"device": "total"})", "SpaceIO is not array."},
         {R"([{"device": "total"}, 3])", "SpaceIO element 1 is not an object"},
         {R"([{"device": "total"}, {"device": 7}])", R"(SpaceIO element 1: "device" is not a string)"},
-        {R"([{"device": ["sda"]}])", R"(SpaceIO element 0: "device" is not a string)"},
-    };
+        {R"([{"device": ["sda"]}])", R"(SpaceIO element 0: "device" is not a string)"}};
     for (const auto &c : cases) {
-        SCOPED_TRACE(c.spaceIO);
-        korvtest::ClearLog();
+        korvtest::ClearLog(); SCOPED_TRACE(c.spaceIO);
         EXPECT_EQ(Fill(Parse(c.spaceIO), false), Parse(R"({"earlier": 1})"));
-        EXPECT_THAT(korvtest::LoggedMessages(),
-                    ::testing::ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
+        EXPECT_THAT(korvtest::LoggedMessages(), ElementsAre(korvtest::Logged(LOG_ERR, kUnit, c.message)));
     }
-    korvtest::ClearLog();  // an empty section gives an empty volume list
+    // An empty section gives an empty volume list.
+    korvtest::ClearLog(); Json::Value notAnObject = "x";
     EXPECT_EQ(Fill(Json::Value(Json::arrayValue)), Parse(R"({"earlier": 1, "volume": []})"));
-    Json::Value notAnObject = "x";
     EXPECT_TRUE(KORVSNMP::FillInCurrentSpaceIO(Parse(R"([{"device": "total"}])"), notAnObject));
     EXPECT_EQ(notAnObject, Parse(R"({"volume": [], "total": {"device": "total"}})"));
     EXPECT_THAT(korvtest::LoggedMessages(), IsEmpty());
@@ -77,19 +74,15 @@ struct SpaceIONodeTest : SpaceIOTest {
     {
         SpaceIOTest::SetUp();
         if (std::string whyNot; !nodes_.Make(5, whyNot)) GTEST_SKIP() << whyNot;
-        directory_ = nodes_.Directory();
-        std::ofstream(directory_ + "/regular") << "not a device";
+        directory_ = nodes_.Directory(); std::ofstream(directory_ + "/regular") << "not a device";
     }
     const std::string &Node(size_t i) const { return nodes_.Node(i); }
 
     // The record of device `i`'s kernel name with `members`.
     std::string Record(size_t i, const std::string &members = "") const
-    {
-        return R"({"device": ")" + nodes_.Name(i) + '"' + (members.empty() ? "" : ", " + members) + "}";
-    }
+    { return R"({"device": ")" + nodes_.Name(i) + '"' + (members.empty() ? "" : ", " + members) + "}"; }
 
-    korvtest::BlockNodes nodes_;
-    std::string directory_;
+    korvtest::BlockNodes nodes_; std::string directory_;
 };
 
 TEST_F(SpaceIONodeTest, SpaceDevicesAreNamedAndTheLastTotalKept)
@@ -159,15 +152,13 @@ TEST_F(SpaceIONodeTest, UnresolvedNodesAndCaches)
 // its own, with one long link.
 TEST_F(SpaceIONodeTest, OverlongLinkTargetIsCutAndTerminated)
 {
-    constexpr int kRefused = 77;
     const std::string target = "../" + std::string(1000, 'd') + "/abcdefghijklmnopqrstuvwxyz0123456789";
     const std::string key = target.substr(0, 1023).substr(1004);
-    korvstandin::Host().spaces = {{Node(0), "long link"}};
+    constexpr int kRefused = 77; korvstandin::Host().spaces = {{Node(0), "long link"}};
     const std::string link = std::string(kSysBlock) + "/" + std::to_string(nodes_.Device(0).major) +
                              ":" + std::to_string(nodes_.Device(0).minor);
 
-    pid_t child = fork();
-    ASSERT_NE(child, -1) << std::strerror(errno);
+    pid_t child = fork(); ASSERT_NE(child, -1) << std::strerror(errno);
     if (child == 0) {
         if (unshare(CLONE_NEWNS) != 0 || mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
             mount("tmpfs", kSysBlock, "tmpfs", 0, nullptr) != 0 || symlink(target.c_str(), link.c_str()) != 0)
@@ -176,8 +167,7 @@ TEST_F(SpaceIONodeTest, OverlongLinkTargetIsCutAndTerminated)
         _exit(KORVSNMP::FillInCurrentSpaceIO(Parse(R"([{"device": ")" + key + R"("}])"), space) && space["volume"].size() == 1 &&
                       space["volume"][0]["display_name"] == "long link" ? 0 : 1);
     }
-    int status = 0;
-    ASSERT_EQ(waitpid(child, &status, 0), child);
+    int status = 0; ASSERT_EQ(waitpid(child, &status, 0), child);
     ASSERT_TRUE(WIFEXITED(status)) << "the child ended abnormally";
     if (WEXITSTATUS(status) == kRefused)
         GTEST_SKIP() << "cannot replace " << kSysBlock << " in a private mount namespace";

@@ -32,19 +32,14 @@ struct HostFileTest : korvtest::PlatformTest {
     void UseHostFile(const std::string &text)
     {
         std::ofstream(path_, std::ios::binary | std::ios::trunc) << text;
-        setenv(korvstandin::kHostFileVariable, path_.c_str(), 1);
-        korvstandin::UseProcessHost();
+        setenv(korvstandin::kHostFileVariable, path_.c_str(), 1); korvstandin::UseProcessHost();
         korvtest::ClearLog();
     }
 
     const std::string path_ = "/tmp/korvsnmp-host-" + std::to_string(getpid()) + ".json";
 };
 
-std::string FileText(const char *path)
-{
-    std::ifstream in(path);
-    return {std::istreambuf_iterator<char>(in), {}};
-}
+std::string FileText(const char *p) { std::ifstream in(p); return {std::istreambuf_iterator<char>(in), {}}; }
 
 TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
 {
@@ -55,20 +50,16 @@ TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
     std::vector<korvexample::SpaceDevice> devices;
     for (size_t i = 0; i < spaces; ++i) devices.push_back({nodes.Node(i), nodes.Name(i)});
     const korvexample::Appliance appliance = korvexample::MakeAppliance(shape, devices);
-    const Json::Value request(Json::objectValue);
-    korvstandin::Host() = appliance.host;
-    Json::Value inMemory;
+    const Json::Value request(Json::objectValue); korvstandin::Host() = appliance.host;
+    Json::Value inMemory, fromFile;
     ASSERT_TRUE(SNMPParseReplyData(request, appliance.reply, inMemory));
 
     const std::string text = korvstandin::HostFileText(appliance.host);
-    korvstandin::HostDescription read;
-    std::string error;
+    korvstandin::HostDescription read; std::string error;
     ASSERT_TRUE(korvstandin::ParseHostDescription(text, read, error)) << error;
     EXPECT_EQ(korvstandin::HostFileText(read), text);  // written and read back the same
 
-    UseHostFile(text);
-    Json::Value fromFile;
-    ASSERT_TRUE(SNMPParseReplyData(request, appliance.reply, fromFile));
+    UseHostFile(text); ASSERT_TRUE(SNMPParseReplyData(request, appliance.reply, fromFile));
 
     EXPECT_EQ(korvtest::JsonText(fromFile), korvtest::JsonText(inMemory));
     EXPECT_FALSE(fromFile["space"]["volume"].empty());  // the nodes resolved: spaces are named
@@ -122,8 +113,7 @@ const BadFile kBadFiles[] = {
      "interfaces[0].members: 33 elements, more than 32"},
     {"TenThousandInterfaces", R"({"interfaces": [)" + Repeated(R"({"name": "eth0"})", 10000) + "]}",
      "interfaces: 10000 elements, more than 256"},
-    {"DeeplyNested", std::string(100000, '[') + std::string(100000, ']'), "not JSON: "},
-};
+    {"DeeplyNested", std::string(100000, '[') + std::string(100000, ']'), "not JSON: "}};
 
 TEST_F(HostFileTest, BadFileFailsEveryOperationWithOneMessage)
 {

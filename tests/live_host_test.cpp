@@ -40,9 +40,8 @@ TEST_F(LiveHostTest, DisksSpacesAndLunsAreProbed)
     Write("sys/devices/pci0/usb2/2-1/host6/block/sdc/device/model", "DataTraveler\n");
     fs::create_directory_symlink("../devices/pci0/usb2/2-1/host6/block/sdc", root_ / "sys/block/sdc");
 
-    HostDescription host;
-    korvstandin::live::ProbeDisks(root_.string(), host);
-    std::vector<std::string> disks;
+    HostDescription host; korvstandin::live::ProbeDisks(root_.string(), host);
+    std::vector<std::string> disks, spaces;
     for (const korvstandin::Disk &disk : host.disks)
         disks.push_back(std::to_string(disk.number) + (disk.container == DISK_CONTAINER_INTERNAL ? " internal " : " ")
                         + disk.devicePath);
@@ -55,15 +54,13 @@ TEST_F(LiveHostTest, DisksSpacesAndLunsAreProbed)
     Write("proc/self/mounts", "/dev/vda1 / ext4 rw 0 0\nproc /proc proc rw 0 0\n"
                               "/dev/vdb1 /volume\\0401 xfs rw 0 0\n/dev/vda1 /mnt/again ext4 rw 0 0\n");
     korvstandin::live::ProbeSpaces(root_.string(), host);
-    std::vector<std::string> spaces;
     for (const korvstandin::Space &space : host.spaces) spaces.push_back(space.devicePath + "=" + space.name);
     EXPECT_THAT(spaces, ElementsAre("/dev/vda1=root", "/dev/vdb1=volume 1"));
 
     Write("sys/kernel/config/target/core/iblock_0/lun_a/wwn/vpd_unit_serial",
           "T10 VPD Unit Serial Number: 6001405abcdef\n");
     Write("sys/kernel/config/target/core/iblock_0/lun_without_serial");
-    korvstandin::live::ProbeLuns(root_.string(), host);
-    ASSERT_EQ(host.luns.size(), 1u);
+    korvstandin::live::ProbeLuns(root_.string(), host); ASSERT_EQ(host.luns.size(), 1u);
     EXPECT_EQ(host.luns[0].uuid.asString() + "=" + host.luns[0].name.asString(), "6001405abcdef=lun_a");
 }
 
@@ -74,8 +71,7 @@ TEST_F(LiveHostTest, InterfacesWithVlansBondsAndPpp)
     Write("sys/class/net/bond0/bonding/slaves", "eth0 eth1\n");
     Write("proc/net/vlan/config", "VLAN Dev name    | VLAN ID\nName-Type: VLAN_NAME_TYPE_RAW_PLUS_VID_NO_PAD\n"
                                   "eth0.5         | 5  | eth0\n");
-    const std::string root = root_.string();
-    using korvstandin::live::ProbeInterface;
+    const std::string root = root_.string(); using korvstandin::live::ProbeInterface;
 
     EXPECT_THAT(korvstandin::live::ProbeInterfaceNames(root), ElementsAre("bond0", "eth0", "eth0.5", "eth1", "ppp0"));
     EXPECT_EQ(ProbeInterface(root, "bond0")->role, NetRole::Aggregation);
@@ -90,15 +86,13 @@ TEST_F(LiveHostTest, InterfacesWithVlansBondsAndPpp)
 
 TEST_F(LiveHostTest, StringsFileWhenPresentElseShippedTexts)
 {
-    HostDescription shipped;
-    korvstandin::live::ProbeStrings(root_.string(), shipped);
+    HostDescription shipped, present; korvstandin::live::ProbeStrings(root_.string(), shipped);
     auto &texts = shipped.files[korvstandin::kStringsFilePath]["volume"];
     EXPECT_EQ(texts["volume_disk"] + "/" + texts["volume_expansion"] + "/" + texts["dedicated_ssd_cache"],
               "Disk/Expansion Unit/SSD Cache");
 
     Write(korvstandin::kStringsFilePath + 1,
           "# web texts\n[common]\nok = \"OK\"\n[volume]\nvolume_disk=\"Laufwerk\"\n");
-    HostDescription present;
     korvstandin::live::ProbeStrings(root_.string(), present);
     EXPECT_EQ(present.files[korvstandin::kStringsFilePath],
               (korvstandin::SectionedFile{{"common", {{"ok", "OK"}}}, {"volume", {{"volume_disk", "Laufwerk"}}}}));
@@ -106,15 +100,13 @@ TEST_F(LiveHostTest, StringsFileWhenPresentElseShippedTexts)
 
 TEST_F(LiveHostTest, StandinAnswersFromThisMachineUntilDescribed)
 {
-    unsetenv("KORVPLATFORM_HOST");
-    korvstandin::UseProcessHost();
+    unsetenv("KORVPLATFORM_HOST"); korvstandin::UseProcessHost();
 
     EXPECT_EQ(KLIBSystemPhysMemSizeGet(), korvstandin::live::ProbeMemory());
     EXPECT_GT(KLIBSystemPhysMemSizeGet(), 0u);
-    KLIBNetInterfaceInfo records[32] = {};
+    KLIBNetInterfaceInfo records[32] = {}; char text[256] = {};
     for (int i = 0, count = KLIBNetGetInterfaceInfo(records, 32, 6); i < count; ++i)
         EXPECT_STRNE(records[i].name, "lo");
-    char text[256] = {};
     EXPECT_EQ(KLIBCFileGetSectionValue(korvstandin::kStringsFilePath, "volume", "volume_disk", text, sizeof text), 0);
     EXPECT_STRNE(text, "");
 
