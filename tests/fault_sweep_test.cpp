@@ -3,7 +3,6 @@
 // in turn, then every allocation in turn. Each case must give the failure's
 // result, log exactly the failure's messages, each once, and leave nothing
 // of the platform unreleased.
-#include <algorithm>
 #include <map>
 #include <new>
 #include <optional>

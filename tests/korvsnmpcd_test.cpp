@@ -9,7 +9,6 @@
 #include <chrono>
 #include <fstream>
 #include <memory>
-#include <thread>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

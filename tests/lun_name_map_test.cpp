@@ -1,7 +1,6 @@
 // The LUN names held over a long LUN list: the names by UUID must survive
 // the list's growth, duplicates included (the later LUN's name counts).
 #include <string>
-#include <utility>
 
 #include <gtest/gtest.h>
 

@@ -2,9 +2,10 @@
 // appliance's recorded reply, korvsnmp-stat reads the appliance's host
 // description file, and what it prints is exactly what the library assembles
 // in this process from the same two files.
-#include <cstdio>
+#include <csignal>
 #include <cstdlib>
 #include <string>
+#include <vector>
 
 #include <gtest/gtest.h>
 #include <json/value.h>
@@ -21,19 +22,6 @@ namespace {
 
 constexpr char kHostFile[] = KORVSNMP_EXAMPLES_DIR "/large-appliance.host.json";
 constexpr char kReplyFile[] = KORVSNMP_EXAMPLES_DIR "/large-appliance.reply.json";
-
-// Standard output of a shell command.
-std::string Output(const std::string &command)
-{
-    std::string text;
-    if (FILE *pipe = popen(command.c_str(), "r")) {
-        char buffer[65536];
-        for (size_t got; (got = fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-            text.append(buffer, got);
-        pclose(pipe);
-    }
-    return text;
-}
 
 using SimulatedAppliance = korvtest::PlatformTest;
 
@@ -53,9 +41,12 @@ TEST_F(SimulatedAppliance, KorvsnmpStatPrintsWhatTheLibraryAssemblesFromTheSameF
                                          socket + ".log");
     ASSERT_TRUE(korvtest::WaitUntilConnectable(socket)) << collector.Log();
 
-    const std::string printed = Output(korvtest::RedirectedChildPrefix() + korvstandin::kHostFileVariable + "=" +
-                                       kHostFile + " " KORVSNMP_STAT_PATH " --compact");
-    EXPECT_EQ(korvtest::JsonText(korvtest::ParseJson(printed)), korvtest::JsonText(inProcess));
+    std::vector<std::string> command = korvtest::RedirectedChildVariables();
+    command.insert(command.end(), {std::string(korvstandin::kHostFileVariable) + "=" + kHostFile,
+                                   KORVSNMP_STAT_PATH, "--compact"});
+    korvtest::CollectorProcess korvsnmpStat("/usr/bin/env", command, socket + ".stat");  // its output, stderr included
+    ASSERT_EQ(korvsnmpStat.WaitForExit(), 0) << korvsnmpStat.Log();
+    EXPECT_EQ(korvtest::JsonText(korvtest::ParseJson(korvsnmpStat.Log())), korvtest::JsonText(inProcess));
     EXPECT_EQ(collector.Stop(SIGTERM), 0) << collector.Log();
 }
 

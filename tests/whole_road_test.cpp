@@ -2,7 +2,6 @@
 // the collector, its reply parsed, and the result assembled against a host
 // with disks of every kind, a VLAN, an aggregation, PPPoE, spaces with a
 // flash cache and LUNs.
-#include <syslog.h>
 
 #include <string>
 

@@ -1,7 +1,6 @@
 #include "client_crowd.h"
 
 #include <dirent.h>
-#include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -13,7 +12,6 @@
 #include <filesystem>
 #include <iterator>
 #include <random>
-#include <sstream>
 
 #include <json/value.h>
 
