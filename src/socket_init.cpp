@@ -6,6 +6,7 @@
 
 #include "korvsnmp/transmitor.h"
 #include "protocol/collector_protocol.h"
+#include "protocol/peer_credentials.h"
 #include "protocol/unique_fd.h"
 #include "protocol/unit_log.h"
 
@@ -16,6 +17,27 @@ using korvproto::kCollectorSocketPath;
 
 static_assert(sizeof kCollectorSocketPath <= sizeof(sockaddr_un::sun_path),
               "the socket path fits the address");
+
+// Whether the process that answers on `fd` may be the collector: root or our
+// own user. Anyone else who got hold of the path would hand the caller
+// statistics of their making. Logs why not.
+bool AnswersAsCollector(int fd)
+{
+    ucred peer;
+    if (!korvproto::ReadPeerCredentials(fd, peer)) {
+        KORVSNMP_LOG(LOG_ERR, "Cannot tell who answers on [%s], reason: [%m]",
+                     kCollectorSocketPath);
+        return false;
+    }
+    if (korvproto::IsTrustedUser(peer.uid))
+        return true;
+    KORVSNMP_LOG(LOG_ERR,
+                 "The peer on [%s] is not the collector: uid %u (pid %d) is neither root "
+                 "nor uid %u",
+                 kCollectorSocketPath, static_cast<unsigned>(peer.uid), static_cast<int>(peer.pid),
+                 static_cast<unsigned>(geteuid()));
+    return false;
+}
 
 }  // namespace
 
@@ -38,5 +60,8 @@ int SocketInit()
                      kCollectorSocketPath);
         return -1;
     }
+    // Before one byte of the request goes out.
+    if (!AnswersAsCollector(fd.Get()))
+        return -1;
     return fd.Release();
 }

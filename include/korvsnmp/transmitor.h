@@ -6,6 +6,11 @@
 // compact JSON text of the request (ending in a line feed) and a NUL, both
 // counted in the length. A reply length of 0 or less means an empty reply.
 //
+// Only root or the caller's own effective user is believed to be the
+// collector: a connection whose peer runs as anyone else (a local user who
+// bound the path first) fails as a connection that cannot be made fails,
+// before one byte is sent, with the peer's uid and pid logged.
+//
 // No call throws, apart from std::bad_alloc; every failure is logged once to
 // syslog and reported as -1 (or false).
 #ifndef KORVSNMP_TRANSMITOR_H
@@ -19,7 +24,9 @@
 
 // Opens a new connection to the collector. Returns the connected descriptor,
 // or -1 (logged at LOG_INFO) when the socket cannot be made or the collector
-// does not accept. The caller owns the descriptor.
+// does not accept, and -1 (logged at LOG_ERR, naming the peer's uid and pid)
+// when the peer is neither root nor the caller's effective user, or the
+// kernel cannot tell who it is. The caller owns the descriptor.
 KORVSNMP_EXPORT int SocketInit();
 
 class KORVSNMP_EXPORT Transmitor {
@@ -65,7 +72,8 @@ public:
 
     // Control requests, each on a connection and a Transmitor of its own.
     // True only when the collector answers with an object whose "success" is
-    // the boolean true.
+    // the boolean true. The collector refuses them from a caller that is
+    // neither root nor its own user.
     static bool EnterHistoryMode(std::string reason);
     static bool Reload();
 

@@ -111,7 +111,7 @@ std::string StatisticsReplyText(const Rates &rates, const Snapshot &sample)
     return korvproto::CompactJson(StatisticsReply(rates, sample));
 }
 
-RequestKind ReadRequest(std::string_view body)
+RequestKind ReadRequest(std::string_view body, bool mayControl)
 {
     while (!body.empty() && body.back() == '\0')
         body.remove_suffix(1);
@@ -131,6 +131,10 @@ RequestKind ReadRequest(std::string_view body)
 
     const Json::Value &object = request;
     const Json::Value &kind = object["request"];
+    const bool control = kind.isString() && (kind.asString() == kReloadRequest ||
+                                             kind.asString() == kHistoryModeRequest);
+    if (control && !mayControl)
+        return RequestKind::kForbiddenControl;
     if (kind.isString() && kind.asString() == kReloadRequest) {
         KORVSNMP_LOG(LOG_NOTICE, "Reload requested; nothing to reload, sampling goes on");
         return RequestKind::kControl;
@@ -150,6 +154,9 @@ std::string ControlReply(RequestKind kind)
 {
     if (kind == RequestKind::kNotAnObject)
         return korvproto::CompactJson(Refusal("the request is not a JSON object"));
+    if (kind == RequestKind::kForbiddenControl)
+        return korvproto::CompactJson(
+            Refusal("control requests need root or the collector's own user"));
     Json::Value success(Json::objectValue);
     success["success"] = true;
     return korvproto::CompactJson(success);

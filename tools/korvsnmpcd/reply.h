@@ -21,18 +21,20 @@ Json::Value StatisticsReply(const Rates &rates, const Snapshot &sample);
 std::string StatisticsReplyText(const Rates &rates, const Snapshot &sample);
 
 enum class RequestKind {
-    kStatistics,   // any JSON object that is not a control request
-    kControl,      // {"request":"reload"} or {"request":"history_mode","reason":...}
-    kNotAnObject,  // anything else: refused
+    kStatistics,       // any JSON object that is not a control request
+    kControl,          // {"request":"reload"} or {"request":"history_mode","reason":...}
+    kForbiddenControl, // a control request from a client that may not steer: refused
+    kNotAnObject,      // anything else: refused
 };
 
-// The kind of one request body (JSON text; trailing NULs are ignored). Logs
-// each control request (the reload, the history mode's reason); logs nothing
-// for the others. Never throws but std::bad_alloc.
-RequestKind ReadRequest(std::string_view body);
+// The kind of one request body (JSON text; trailing NULs are ignored). A
+// control request is kControl when `mayControl`, else kForbiddenControl.
+// Logs each control request carried out (the reload, the history mode's
+// reason); logs nothing for the others. Never throws but std::bad_alloc.
+RequestKind ReadRequest(std::string_view body, bool mayControl = true);
 
-// The reply body to a request of `kind`, kControl or kNotAnObject:
-// {"success":true}, or {"success":false,"error":...}.
+// The reply body to a request of `kind`, kControl, kForbiddenControl or
+// kNotAnObject: {"success":true}, or {"success":false,"error":...}.
 std::string ControlReply(RequestKind kind);
 
 }  // namespace korvsnmpcd

@@ -7,13 +7,16 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
+#include <pwd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstring>
+#include <random>
 #include <vector>
 
+#include "protocol/peer_credentials.h"
 #include "protocol/unit_log.h"
 #include "reply.h"
 #include "reply_file.h"
@@ -54,6 +57,87 @@ bool SomeoneAnswers(const sockaddr_un &address)
     return connect(probe.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) == 0;
 }
 
+// The socket is made under a temporary name beside its path: the path plus
+// this separator and kTemporaryLetters random letters.
+constexpr char kTemporarySeparator = '.';
+constexpr size_t kTemporaryLetters = 6;
+constexpr int kTemporaryNameTries = 16;
+
+// "uid N (name)", or "uid N" for a user without a name.
+std::string DescribeUser(uid_t uid)
+{
+    std::string text = "uid " + std::to_string(uid);
+    passwd entry;
+    passwd *found = nullptr;
+    char buffer[4096];
+    if (getpwuid_r(uid, &entry, buffer, sizeof buffer, &found) == 0 && found != nullptr)
+        text += std::string(" (") + found->pw_name + ")";
+    return text;
+}
+
+const char *DescribeKind(mode_t mode)
+{
+    if (S_ISSOCK(mode))
+        return "socket";
+    if (S_ISREG(mode))
+        return "regular file";
+    if (S_ISLNK(mode))
+        return "symbolic link";
+    if (S_ISDIR(mode))
+        return "directory";
+    return "special file";
+}
+
+// Removes a socket file made under a temporary name, unless Keep() was called.
+class TemporarySocketFile {
+public:
+    TemporarySocketFile() = default;
+    ~TemporarySocketFile()
+    {
+        if (!path_.empty())
+            unlink(path_.c_str());
+    }
+    TemporarySocketFile(const TemporarySocketFile &) = delete;
+    TemporarySocketFile &operator=(const TemporarySocketFile &) = delete;
+
+    void Hold(std::string path) { path_ = std::move(path); }
+    const std::string &Path() const { return path_; }
+    void Keep() { path_.clear(); }
+
+private:
+    std::string path_;
+};
+
+// Binds `fd` to a new name beside `path` that nobody holds yet, held by
+// `made`. False (logged) when no such name fits or can be bound.
+bool BindBeside(int fd, const std::string &path, TemporarySocketFile &made)
+{
+    static constexpr char kLetters[] = "abcdefghijklmnopqrstuvwxyz0123456789";
+    std::random_device random;
+    std::uniform_int_distribution<size_t> pick(0, sizeof kLetters - 2);
+    for (int attempt = 0; attempt < kTemporaryNameTries; ++attempt) {
+        std::string name = path + kTemporarySeparator;
+        for (size_t i = 0; i < kTemporaryLetters; ++i)
+            name += kLetters[pick(random)];
+        sockaddr_un address;
+        if (!FillAddress(name, address)) {
+            KORVSNMP_LOG(LOG_ERR, "Socket path [%s] leaves no room for a temporary name beside it",
+                         path.c_str());
+            return false;
+        }
+        if (bind(fd, reinterpret_cast<const sockaddr *>(&address), sizeof address) == 0) {
+            made.Hold(std::move(name));
+            return true;
+        }
+        if (errno != EADDRINUSE) {
+            KORVSNMP_LOG(LOG_ERR, "Cannot bind [%s]: %m", name.c_str());
+            return false;
+        }
+    }
+    KORVSNMP_LOG(LOG_ERR, "Cannot find a free temporary name beside [%s]", path.c_str());
+    return false;
+}
+
 int MillisecondsUntil(Clock::time_point when, Clock::time_point now)
 {
     if (when <= now)
@@ -76,6 +160,8 @@ bool SomethingListensOn(const std::string &path)
 
 struct Server::Connection {
     UniqueFd fd;
+    ucred peer{0, static_cast<uid_t>(-1), static_cast<gid_t>(-1)};
+    bool mayControl = false;  // root or the collector's own user
     Clock::time_point deadline;
     RequestDecoder request;
     std::string reply;  // the whole reply frame, once the request is in
@@ -169,53 +255,79 @@ bool Server::TakeSocketPath()
         KORVSNMP_LOG(LOG_ERR, "Socket path [%s] is empty or too long", path);
         return false;
     }
-
-    struct stat existing;
-    if (lstat(path, &existing) == 0) {
-        if (!S_ISSOCK(existing.st_mode)) {
-            KORVSNMP_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
-            return false;
-        }
-        if (SomeoneAnswers(address)) {
-            KORVSNMP_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting",
-                           path);
-            return false;
-        }
-        if (errno != ECONNREFUSED) {
-            KORVSNMP_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
-            return false;
-        }
-        if (unlink(path) != 0 && errno != ENOENT) {
-            KORVSNMP_LOG(LOG_ERR, "Cannot remove the stale socket file [%s]: %m", path);
-            return false;
-        }
-        KORVSNMP_LOG(LOG_NOTICE, "Replaced the stale socket file [%s]", path);
-    } else if (errno != ENOENT) {
-        KORVSNMP_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
+    std::string replacing;  // what the new socket takes the place of, for the log
+    if (!JudgeSocketPath(address, replacing))
         return false;
-    }
 
     listening_ = UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
     if (!listening_.Valid()) {
         KORVSNMP_LOG(LOG_ERR, "Cannot create the listening socket: %m");
         return false;
     }
-    if (bind(listening_.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0) {
-        KORVSNMP_LOG(LOG_ERR, "Cannot bind [%s]: %m", path);
+    // Made whole under a name of its own, then renamed over the path: a
+    // caller never meets a socket that does not listen yet, and nobody can
+    // slip in between a removal and the bind.
+    TemporarySocketFile made;
+    if (!BindBeside(listening_.Get(), options_.socketPath, made))
         return false;
-    }
-    struct stat made;
-    if (lstat(path, &made) == 0) {
-        socketDevice_ = made.st_dev;
-        socketInode_ = made.st_ino;
-        ownsSocketFile_ = true;
-    }
-    if (chmod(path, kSocketMode) != 0)
+    if (chmod(made.Path().c_str(), kSocketMode) != 0)
         KORVSNMP_LOG(LOG_WARNING, "Cannot open [%s] to every local user: %m", path);
     if (listen(listening_.Get(), kListenBacklog) != 0) {
-        KORVSNMP_LOG(LOG_ERR, "Cannot listen on [%s]: %m", path);
+        KORVSNMP_LOG(LOG_ERR, "Cannot listen on [%s]: %m", made.Path().c_str());
         return false;
     }
+    if (rename(made.Path().c_str(), path) != 0) {
+        KORVSNMP_LOG(LOG_ERR, "Cannot put the socket at [%s]: %m", path);
+        return false;
+    }
+    made.Keep();
+    if (!replacing.empty())
+        KORVSNMP_LOG(LOG_WARNING, "Replaced %s", replacing.c_str());
+    struct stat placed;
+    if (lstat(path, &placed) == 0) {
+        socketDevice_ = placed.st_dev;
+        socketInode_ = placed.st_ino;
+        ownsSocketFile_ = true;
+    }
+    return true;
+}
+
+bool Server::JudgeSocketPath(const sockaddr_un &address, std::string &replacing)
+{
+    const char *path = address.sun_path;
+    struct stat existing;
+    if (lstat(path, &existing) != 0) {
+        if (errno == ENOENT)
+            return true;
+        KORVSNMP_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
+        return false;
+    }
+    const std::string owner = DescribeUser(existing.st_uid);
+    if (!korvproto::IsTrustedUser(existing.st_uid)) {
+        // Another user's: whatever it is, it is not this collector, and the
+        // library would not believe it anyway.
+        if (S_ISDIR(existing.st_mode) && rmdir(path) != 0) {
+            KORVSNMP_LOG(LOG_ERR, "[%s] is a directory of %s that cannot be removed: %m", path,
+                         owner.c_str());
+            return false;
+        }
+        replacing = std::string("[") + path + "], a " + DescribeKind(existing.st_mode) + " of " +
+                    owner + ", not this collector's";
+        return true;
+    }
+    if (!S_ISSOCK(existing.st_mode)) {
+        KORVSNMP_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
+        return false;
+    }
+    if (SomeoneAnswers(address)) {
+        KORVSNMP_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting", path);
+        return false;
+    }
+    if (errno != ECONNREFUSED) {
+        KORVSNMP_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
+        return false;
+    }
+    replacing = std::string("the stale socket file [") + path + "] of " + owner;
     return true;
 }
 
@@ -299,6 +411,9 @@ void Server::AcceptPending()
         connection.self = std::prev(connections_.end());
         connection.fd = std::move(fd);
         connection.deadline = Clock::now() + options_.clientTimeout;
+        // Statistics go to anyone; only root and our own user may steer.
+        connection.mayControl = korvproto::ReadPeerCredentials(connection.fd.Get(), connection.peer) &&
+                                korvproto::IsTrustedUser(connection.peer.uid);
         if (!Watch(connection.fd.Get(), EPOLLIN, &connection))
             connections_.pop_back();
     }
@@ -388,10 +503,17 @@ void Server::Receive(Connection &connection, StatisticsSource &source)
 
 void Server::Answer(Connection &connection, StatisticsSource &source)
 {
-    RequestKind kind = ReadRequest(connection.request.Body());
+    RequestKind kind = ReadRequest(connection.request.Body(), connection.mayControl);
     if (kind != RequestKind::kStatistics) {
         if (kind == RequestKind::kNotAnObject)
             Note(Event::kRefusedBody, Clock::now());
+        if (kind == RequestKind::kForbiddenControl)
+            KORVSNMP_LOG(LOG_WARNING,
+                         "Refused a control request from uid %u (pid %d): only root and uid %u "
+                         "may steer the collector",
+                         static_cast<unsigned>(connection.peer.uid),
+                         static_cast<int>(connection.peer.pid),
+                         static_cast<unsigned>(geteuid()));
         connection.reply = korvproto::EncodeFrame(ControlReply(kind));
     } else {
         const std::string &statistics = source.Reply();

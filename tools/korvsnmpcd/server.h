@@ -8,12 +8,16 @@
 // frame that claims an impossible length is closed at once. Every pending
 // connection is accepted at once; at the connection cap the oldest
 // connection that has not sent its whole request yet (else the oldest one)
-// is closed to make room, so idle clients cannot lock out a caller. Refused
-// frames, timeouts and evictions are logged at most once per log period.
+// is closed to make room, so idle clients cannot lock out a caller.
+// Statistics go to every local user; a control request from a client that
+// is neither root nor the collector's own user (its credentials read from
+// the kernel) is refused and logged with its uid. Refused frames, timeouts
+// and evictions are logged at most once per log period.
 #ifndef KORVSNMPCD_SERVER_H
 #define KORVSNMPCD_SERVER_H
 
 #include <sys/types.h>
+#include <sys/un.h>
 
 #include <chrono>
 #include <cstddef>
@@ -61,9 +65,14 @@ public:
     Server &operator=(const Server &) = delete;
 
     // Blocks SIGTERM and SIGINT for the loop, raises the descriptor limit
-    // for the connection cap, then takes the socket path: refuses (false,
-    // logged) when another daemon answers there or the path is not a socket;
-    // replaces a stale socket file.
+    // for the connection cap, then takes the socket path. Refuses (false,
+    // logged) when a collector of root or our own user answers there, or
+    // when something of ours there is not a socket. Replaces, logging a
+    // warning that names the owner, a stale socket file and anything of
+    // another user (which takes CAP_FOWNER in a sticky directory such as
+    // /tmp). The socket is bound under a temporary name beside the path
+    // (the path plus 7 characters must fit a socket address), opened to
+    // every user, and renamed over the path once it listens.
     bool Listen();
 
     // Serves until SIGTERM or SIGINT; false when the loop cannot go on.
@@ -78,6 +87,9 @@ private:
 
     bool FitConnectionCap();
     bool TakeSocketPath();
+    // Whether the path may be taken; `replacing` then names what is there
+    // to be replaced, if anything.
+    bool JudgeSocketPath(const sockaddr_un &address, std::string &replacing);
     bool Watch(int fd, uint32_t events, void *tag);
     void AcceptPending();
     void MakeRoom();

@@ -29,6 +29,16 @@ int Fail(const std::string &what)
     return kExitFailure;
 }
 
+// Why a control request failed, as far as this side can tell: the collector
+// takes them only from root (or its own user).
+std::string ControlFailure(const char *what)
+{
+    std::string text = what;
+    if (geteuid() != 0)
+        text += "; control requests need root, and this runs as uid " + std::to_string(geteuid());
+    return text;
+}
+
 Json::Value BuildRequest(const std::vector<std::string> &resources)
 {
     Json::Value request(Json::objectValue);
@@ -111,11 +121,11 @@ int main(int argc, char **argv)
         std::cout << "korvsnmp-stat " KORVSNMP_VERSION "\n";
         return 0;
     case korvstat::Action::Reload:
-        return Transmitor::Reload() ? 0 : Fail("the collector did not reload");
+        return Transmitor::Reload() ? 0 : Fail(ControlFailure("the collector did not reload"));
     case korvstat::Action::HistoryMode:
         return Transmitor::EnterHistoryMode(options.reason)
                    ? 0
-                   : Fail("the collector did not enter history mode");
+                   : Fail(ControlFailure("the collector did not enter history mode"));
     case korvstat::Action::Statistics:
         break;
     }
