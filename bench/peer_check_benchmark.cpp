@@ -3,6 +3,7 @@
 //
 //   connect:          socket + connect + close, the floor of every exchange
 //   connect+check:    the same with the peer's credentials read and judged
+//   check:            reading and judging them alone, on one connection
 //   SocketInit:       the library's own connect, check included
 //   exchange:         Transmitor::Transmit of {} answered with {}, the
 //                     smallest whole exchange
@@ -67,10 +68,13 @@ public:
     ~Collector()
     {
         stop_ = true;
-        UniqueFd wake(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-        sockaddr_un address = Address();
-        korvtest_connect_unredirected(wake.Get(), reinterpret_cast<sockaddr *>(&address),
-                                      sizeof address);
+        {
+            // Wakes the server's accept; closed at once, so that its read ends.
+            UniqueFd wake(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+            sockaddr_un address = Address();
+            korvtest_connect_unredirected(wake.Get(), reinterpret_cast<sockaddr *>(&address),
+                                          sizeof address);
+        }
         server_.join();
         unlink(path_.c_str());
         rmdir(directory_.c_str());
@@ -139,6 +143,18 @@ void BM_ConnectAndCheck(benchmark::State &state)
     }
 }
 BENCHMARK(BM_ConnectAndCheck);
+
+// The check alone, on one connection.
+void BM_Check(benchmark::State &state)
+{
+    const UniqueFd fd = Connect(TheCollector().Address());
+    for (auto _ : state) {
+        ucred peer;
+        if (!korvproto::ReadPeerCredentials(fd.Get(), peer) || !korvproto::IsTrustedUser(peer.uid))
+            state.SkipWithError("the peer is not trusted");
+    }
+}
+BENCHMARK(BM_Check);
 
 void BM_SocketInit(benchmark::State &state)
 {
