@@ -69,8 +69,8 @@ public:
     // logged) when a collector of root or our own user answers there, or
     // when something of ours there is not a socket. Replaces, logging a
     // warning that names the owner, a stale socket file and anything of
-    // another user (which takes CAP_FOWNER in a sticky directory such as
-    // /tmp). The socket is bound under a temporary name beside the path
+    // another user (in a sticky directory, which only its owner or
+    // CAP_FOWNER may do). The socket is bound under a temporary name beside the path
     // (the path plus 7 characters must fit a socket address), opened to
     // every user, and renamed over the path once it listens.
     bool Listen();
