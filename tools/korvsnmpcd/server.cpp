@@ -2,6 +2,7 @@
 
 #include <signal.h>
 #include <sys/epoll.h>
+#include <sys/random.h>
 #include <sys/resource.h>
 #include <sys/signalfd.h>
 #include <sys/socket.h>
@@ -13,7 +14,6 @@
 #include <cerrno>
 #include <climits>
 #include <cstring>
-#include <random>
 #include <vector>
 
 #include "protocol/peer_credentials.h"
@@ -113,12 +113,16 @@ private:
 bool BindBeside(int fd, const std::string &path, TemporarySocketFile &made)
 {
     static constexpr char kLetters[] = "abcdefghijklmnopqrstuvwxyz0123456789";
-    std::random_device random;
-    std::uniform_int_distribution<size_t> pick(0, sizeof kLetters - 2);
     for (int attempt = 0; attempt < kTemporaryNameTries; ++attempt) {
+        unsigned char noise[kTemporaryLetters] = {};
+        if (getrandom(noise, sizeof noise, 0) != static_cast<ssize_t>(sizeof noise)) {
+            const auto now = static_cast<uint64_t>(Clock::now().time_since_epoch().count());
+            for (size_t i = 0; i < kTemporaryLetters; ++i)
+                noise[i] = static_cast<unsigned char>((now >> (8 * i)) + getpid() + attempt);
+        }
         std::string name = path + kTemporarySeparator;
-        for (size_t i = 0; i < kTemporaryLetters; ++i)
-            name += kLetters[pick(random)];
+        for (unsigned char byte : noise)
+            name += kLetters[byte % (sizeof kLetters - 1)];
         sockaddr_un address;
         if (!FillAddress(name, address)) {
             KORVSNMP_LOG(LOG_ERR, "Socket path [%s] leaves no room for a temporary name beside it",
@@ -136,6 +140,48 @@ bool BindBeside(int fd, const std::string &path, TemporarySocketFile &made)
     }
     KORVSNMP_LOG(LOG_ERR, "Cannot find a free temporary name beside [%s]", path.c_str());
     return false;
+}
+
+// Whether the socket may be put at the path of `address`: nothing is there,
+// or what is there may be replaced, which `replacing` then names for the log.
+// Logs why not.
+bool JudgeSocketPath(const sockaddr_un &address, std::string &replacing)
+{
+    const char *path = address.sun_path;
+    struct stat existing;
+    if (lstat(path, &existing) != 0) {
+        if (errno == ENOENT)
+            return true;
+        KORVSNMP_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
+        return false;
+    }
+    const std::string owner = DescribeUser(existing.st_uid);
+    if (!korvproto::IsTrustedUser(existing.st_uid)) {
+        // Another user's: whatever it is, it is not this collector, and the
+        // library would not believe it anyway.
+        if (S_ISDIR(existing.st_mode) && rmdir(path) != 0) {
+            KORVSNMP_LOG(LOG_ERR, "[%s] is a directory of %s that cannot be removed: %m", path,
+                         owner.c_str());
+            return false;
+        }
+        replacing = std::string("[") + path + "], a " + DescribeKind(existing.st_mode) + " of " +
+                    owner + ", not this collector's";
+        return true;
+    }
+    if (!S_ISSOCK(existing.st_mode)) {
+        KORVSNMP_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
+        return false;
+    }
+    if (SomeoneAnswers(address)) {
+        KORVSNMP_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting", path);
+        return false;
+    }
+    if (errno != ECONNREFUSED) {
+        KORVSNMP_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
+        return false;
+    }
+    replacing = std::string("the stale socket file [") + path + "] of " + owner;
+    return true;
 }
 
 int MillisecondsUntil(Clock::time_point when, Clock::time_point now)
@@ -292,45 +338,6 @@ bool Server::TakeSocketPath()
     return true;
 }
 
-bool Server::JudgeSocketPath(const sockaddr_un &address, std::string &replacing)
-{
-    const char *path = address.sun_path;
-    struct stat existing;
-    if (lstat(path, &existing) != 0) {
-        if (errno == ENOENT)
-            return true;
-        KORVSNMP_LOG(LOG_ERR, "Cannot examine [%s]: %m", path);
-        return false;
-    }
-    const std::string owner = DescribeUser(existing.st_uid);
-    if (!korvproto::IsTrustedUser(existing.st_uid)) {
-        // Another user's: whatever it is, it is not this collector, and the
-        // library would not believe it anyway.
-        if (S_ISDIR(existing.st_mode) && rmdir(path) != 0) {
-            KORVSNMP_LOG(LOG_ERR, "[%s] is a directory of %s that cannot be removed: %m", path,
-                         owner.c_str());
-            return false;
-        }
-        replacing = std::string("[") + path + "], a " + DescribeKind(existing.st_mode) + " of " +
-                    owner + ", not this collector's";
-        return true;
-    }
-    if (!S_ISSOCK(existing.st_mode)) {
-        KORVSNMP_LOG(LOG_ERR, "[%s] exists and is not a socket; not replacing it", path);
-        return false;
-    }
-    if (SomeoneAnswers(address)) {
-        KORVSNMP_LOG(LOG_ERR, "Another collector already answers on [%s]; not starting", path);
-        return false;
-    }
-    if (errno != ECONNREFUSED) {
-        KORVSNMP_LOG(LOG_ERR, "Cannot tell whether a collector answers on [%s]: %m", path);
-        return false;
-    }
-    replacing = std::string("the stale socket file [") + path + "] of " + owner;
-    return true;
-}
-
 bool Server::Run(StatisticsSource &source)
 {
     Clock::time_point nextTick = Clock::now() + options_.interval;
@@ -412,8 +419,9 @@ void Server::AcceptPending()
         connection.fd = std::move(fd);
         connection.deadline = Clock::now() + options_.clientTimeout;
         // Statistics go to anyone; only root and our own user may steer.
-        connection.mayControl = korvproto::ReadPeerCredentials(connection.fd.Get(), connection.peer) &&
-                                korvproto::IsTrustedUser(connection.peer.uid);
+        connection.mayControl =
+            korvproto::ReadPeerCredentials(connection.fd.Get(), connection.peer) &&
+            korvproto::IsTrustedUser(connection.peer.uid);
         if (!Watch(connection.fd.Get(), EPOLLIN, &connection))
             connections_.pop_back();
     }

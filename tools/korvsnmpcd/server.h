@@ -17,7 +17,6 @@
 #define KORVSNMPCD_SERVER_H
 
 #include <sys/types.h>
-#include <sys/un.h>
 
 #include <chrono>
 #include <cstddef>
@@ -87,9 +86,6 @@ private:
 
     bool FitConnectionCap();
     bool TakeSocketPath();
-    // Whether the path may be taken; `replacing` then names what is there
-    // to be replaced, if anything.
-    bool JudgeSocketPath(const sockaddr_un &address, std::string &replacing);
     bool Watch(int fd, uint32_t events, void *tag);
     void AcceptPending();
     void MakeRoom();
