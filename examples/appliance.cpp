@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "catalogue/statistics_catalogue.h"
+
 namespace korvexample {
 namespace {
 
@@ -16,6 +18,12 @@ constexpr unsigned int kRx = 123456;
 constexpr unsigned int kTx = 654321;
 constexpr unsigned int kPercent = 100;
 constexpr int kFirstVlanId = 10;
+constexpr uint64_t kUptimeSeconds = 864000;  // ten days since boot
+constexpr uint64_t kMsPerPercent = 10;        // busy milliseconds a second per percent
+constexpr uint64_t kBytesPerMiB = 1048576;
+constexpr uint64_t kBytesPerPacket = 1024;
+constexpr uint64_t kRarerBy = 1000;           // each later count of a direction: errors, drops
+constexpr char kTotalSuffix[] = "_total";
 
 // sda ... sdz, sdaa ...
 std::string DiskName(int index)
@@ -122,6 +130,77 @@ void AddLuns(const ApplianceShape &shape, HostDescription &host, Json::Value &is
     }
 }
 
+
+using korvcatalogue::Kind;
+using korvcatalogue::Section;
+using korvcatalogue::Statistic;
+using korvcatalogue::Unit;
+
+std::string FirstWord(const std::string &member) { return member.substr(0, member.find('_')); }
+
+uint64_t Number(const Json::Value &record, const std::string &member)
+{
+    const Json::Value *value = record.find(member.data(), member.data() + member.size());
+    return value != nullptr && value->isUInt64() ? value->asUInt64() : 0;
+}
+
+// What a counter would read had the record's rates held since boot. A rate's
+// counter bears its name ("read_byte" counts on as "read_byte_total"). The
+// others follow the statistics before them in the catalogue: CPU ticks and
+// interface bytes the rate of their first word ("user", "rx"), busy time the
+// share of time, mebibytes the byte rate of their first word, and a count
+// without a rate the record's operation rates together (a LUN's commands)
+// or else the byte counter of its first word, each later count rarer
+// (packets, errors, drops).
+uint64_t SinceBoot(const Statistic &counter, const Json::Value &record)
+{
+    const std::string base = counter.member.substr(0, counter.member.size() - sizeof kTotalSuffix + 1);
+    if (korvcatalogue::Find(counter.section, base) != nullptr)
+        return Number(record, base) * kUptimeSeconds;
+    uint64_t perSecond = 0;
+    uint64_t bytes = 0;
+    uint64_t rarer = 1;
+    for (const Statistic *other : korvcatalogue::StatisticsOf(counter.section)) {
+        if (other == &counter)
+            break;
+        const bool sameWord = FirstWord(other->member) == FirstWord(counter.member);
+        const uint64_t value = Number(record, other->member);
+        if (counter.unit == Unit::Milliseconds && other->kind == Kind::Share)
+            perSecond = value * kMsPerPercent;
+        else if (counter.unit != Unit::Operations && sameWord && other->kind != Kind::Counter &&
+                 (counter.unit != Unit::MiB || other->unit == Unit::BytesPerSecond))
+            perSecond = value;
+        else if (counter.unit == Unit::Operations && other->unit == Unit::PerSecond)
+            perSecond += value;
+        else if (counter.unit == Unit::Operations && sameWord && other->unit == Unit::Bytes)
+            bytes = value;
+        else if (counter.unit == Unit::Operations && sameWord && other->unit == Unit::Operations)
+            rarer *= kRarerBy;
+    }
+    if (counter.unit == Unit::MiB)
+        return perSecond * kUptimeSeconds / kBytesPerMiB;
+    if (counter.unit == Unit::Operations && perSecond == 0)
+        return bytes / kBytesPerPacket / rarer;
+    return perSecond * kUptimeSeconds;
+}
+
+// Adds the cumulative counters of `section` to `record`, in the catalogue's order.
+void AddCounters(Section section, Json::Value &record)
+{
+    for (const Statistic *statistic : korvcatalogue::StatisticsOf(section))
+        if (statistic->kind == Kind::Counter)
+            record[statistic->member] = Json::UInt64(SinceBoot(*statistic, record));
+}
+
+// The same for each record of `records` but the collector's own "total",
+// whose counters a consumer sums from the rows.
+void AddCountersToEach(Section section, Json::Value &records)
+{
+    for (Json::Value &record : records)
+        if (record["device"] != "total")
+            AddCounters(section, record);
+}
+
 }  // namespace
 
 ApplianceShape LargeAppliance() { return ApplianceShape{}; }
@@ -180,6 +259,12 @@ Appliance MakeAppliance(const ApplianceShape &shape, const std::vector<SpaceDevi
     data["NFS"]["read_byte"] = 1048576;
     data["NFS"]["write_byte"] = 524288;
     data["time"] = kSampleTime;
+    AddCounters(Section::Cpu, data["System"][0]);
+    AddCountersToEach(Section::Interface, data["Network"]);
+    AddCountersToEach(Section::Disk, data["DiskIO"]);
+    AddCountersToEach(Section::Volume, data["SpaceIO"]);
+    AddCountersToEach(Section::Lun, data["iSCSI"]);
+    AddCounters(Section::Nfs, data["NFS"]);
     return appliance;
 }
 

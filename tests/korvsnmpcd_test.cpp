@@ -36,20 +36,65 @@ using Clock = std::chrono::steady_clock;
 
 constexpr uint32_t kUint32Max = 4294967295u;
 
-std::vector<uint64_t> Fields(std::initializer_list<uint64_t> values) { return values; }
+using korvsnmpcd::Counter;
+
+std::vector<Counter> Fields(std::initializer_list<Counter> values) { return values; }
 
 // ---------------------------------------------------------------- parsers
 
 TEST(KorvsnmpcdParsers, CpuLineOfAllProcessors)
 {
-    korvsnmpcd::CpuTimes t, untouched{7};
+    korvsnmpcd::CpuTimes t;
+    korvsnmpcd::CpuTimes untouched;
+    untouched.user = 7;
     ASSERT_TRUE(korvsnmpcd::ParseCpuTimes("cpu  10 20 30 40 50 60 70 80 90 100\ncpu0 1 2 3 4 5\n", t));
     EXPECT_THAT(Fields({t.user, t.nice, t.system, t.idle, t.iowait, t.irq, t.softirq, t.steal}),
                 ElementsAre(10, 20, 30, 40, 50, 60, 70, 80));
     ASSERT_TRUE(korvsnmpcd::ParseCpuTimes("cpu 1 2 3 4\n", t));  // an old kernel's four fields
-    EXPECT_THAT(Fields({t.idle, t.iowait}), ElementsAre(4, 0));
-    for (const char *bad : {"cpu0 1 2 3 4 5\n", "cpu 1 2 x 4 5\n", ""})
-        EXPECT_TRUE(!korvsnmpcd::ParseCpuTimes(bad, untouched) && untouched.user == 7u) << bad;
+    EXPECT_THAT(Fields({t.idle, t.iowait}), ElementsAre(4, std::nullopt));
+    for (const char *bad : {"cpu0 1 2 3 4 5\n", "cpu 1 2 3\n", ""}) {
+        EXPECT_FALSE(korvsnmpcd::ParseCpuTimes(bad, untouched)) << bad;
+        EXPECT_EQ(untouched.user, 7u) << bad;
+    }
+}
+
+// A field that is no unsigned 64-bit number leaves that one counter out and is noted.
+TEST(KorvsnmpcdParsers, UnreadableCounterFieldsAreLeftOutAndNoted)
+{
+    korvsnmpcd::UnreadableFields unreadable;
+    korvsnmpcd::CpuTimes t;
+    ASSERT_TRUE(korvsnmpcd::ParseCpuTimes("cpu 1 -2 3 4 1.5 6 7 18446744073709551616\n", t, &unreadable));
+    EXPECT_THAT(Fields({t.user, t.nice, t.system, t.idle, t.iowait, t.irq, t.softirq, t.steal}),
+                ElementsAre(1, std::nullopt, 3, 4, std::nullopt, 6, 7, std::nullopt));
+    EXPECT_EQ(unreadable.count, 3u);
+    EXPECT_EQ(unreadable.first, "line [cpu] field 2 [-2]");
+
+    unreadable = {};
+    auto interfaces = korvsnmpcd::ParseNetDev("eth0: 1 2 x 4 5 6 7 8 9 10 11 +12\n", &unreadable);
+    const korvsnmpcd::InterfaceCounters &eth0 = interfaces.at("eth0");
+    EXPECT_THAT(Fields({eth0.rxBytes, eth0.rxPackets, eth0.rxErrors, eth0.rxDrops, eth0.txBytes,
+                        eth0.txPackets, eth0.txErrors, eth0.txDrops}),
+                ElementsAre(1, 2, std::nullopt, 4, 9, 10, 11, std::nullopt));
+    EXPECT_EQ(unreadable.count, 2u);
+    EXPECT_EQ(unreadable.first, "line [eth0] field 3 [x]");
+
+    unreadable = {};
+    auto devices = korvsnmpcd::ParseDiskStats("8 0 sda 1 0 99999999999999999999 0 4 0 8 0 0 ten 0\n", &unreadable);
+    const BlockCounters &sda = devices.at("sda");
+    EXPECT_THAT(Fields({sda.reads, sda.sectorsRead, sda.writes, sda.sectorsWritten, sda.ioTicksMs}),
+                ElementsAre(1, std::nullopt, 4, 8, std::nullopt));
+    EXPECT_EQ(unreadable.first, "line [sda] field 3 [99999999999999999999]");
+
+    unreadable = {};
+    auto nfs = korvsnmpcd::ParseNfsServer("io 5 -6\nrpc 7e3 0 0\n", &unreadable);
+    EXPECT_THAT(Fields({nfs.readBytes, nfs.writtenBytes, nfs.rpcCalls}), ElementsAre(5, std::nullopt, std::nullopt));
+    EXPECT_EQ(unreadable.count, 2u);
+
+    const struct { const char *text; Counter value; } numbers[] = {
+        {"18446744073709551615\n", 18446744073709551615ull}, {"0", 0}, {"", std::nullopt},
+        {"12 13\n", std::nullopt}, {"-1\n", std::nullopt}, {"18446744073709551616\n", std::nullopt}};
+    for (const auto &number : numbers)
+        EXPECT_EQ(korvsnmpcd::ParseSingleNumber(number.text, "lun"), number.value) << number.text;
 }
 
 TEST(KorvsnmpcdParsers, MemoryInterfacesAndNfs)
@@ -66,11 +111,13 @@ TEST(KorvsnmpcdParsers, MemoryInterfacesAndNfs)
         "Inter-|   Receive |  Transmit\n face |bytes packets|bytes packets\n"
         "    lo:    3267      29    0    0    0     0          0         0     4268      29    "
         "0    0    0     0       0          0\n"
-        "eth0:18446744073709551615 5 0 0 0 0 0 0 77 6 0 0 0 0 0 0\n  bad: 1 2 3\n");
+        "eth0:18446744073709551615 5 1 2 0 0 0 0 77 6 3 4 0 0 0 0\n  bad: 1 2 3 4 5 6 7 8 9 10 11\n");
     ASSERT_EQ(interfaces.size(), 2u);
-    EXPECT_THAT(Fields({interfaces.at("eth0").rxBytes, interfaces.at("eth0").txBytes,
-                        interfaces.at("lo").rxBytes, interfaces.at("lo").txBytes}),
-                ElementsAre(18446744073709551615ull, 77, 3267, 4268));
+    const korvsnmpcd::InterfaceCounters &eth0 = interfaces.at("eth0");
+    EXPECT_THAT(Fields({eth0.rxBytes, eth0.rxPackets, eth0.rxErrors, eth0.rxDrops, eth0.txBytes,
+                        eth0.txPackets, eth0.txErrors, eth0.txDrops}),
+                ElementsAre(18446744073709551615ull, 5, 1, 2, 77, 6, 3, 4));
+    EXPECT_THAT(Fields({interfaces.at("lo").rxBytes, interfaces.at("lo").txBytes}), ElementsAre(3267, 4268));
 
     auto nfs = korvsnmpcd::ParseNfsServer(
         "rc 0 12 34\nio 1000 2000\nth 8 0 0 0 0 0 0 0 0 0 0 0\nrpc 55 0 0 0 0\nproc3 22 0 1\n");
@@ -113,10 +160,30 @@ TEST(KorvsnmpcdRates, CounterRules)
     EXPECT_THAT(Fields({busy(1000, 1500), busy(1000, 3000), busy(3000, 1000)}), ElementsAre(50, 100, 0));
 }
 
+korvsnmpcd::CpuTimes Cpu(uint64_t user, uint64_t nice, uint64_t system, uint64_t idle)
+{
+    korvsnmpcd::CpuTimes times;
+    times.user = user;
+    times.nice = nice;
+    times.system = system;
+    times.idle = idle;
+    return times;
+}
+
+korvsnmpcd::InterfaceCounters Traffic(uint64_t rxBytes, uint64_t txBytes)
+{
+    korvsnmpcd::InterfaceCounters counters;
+    counters.rxBytes = rxBytes;
+    counters.txBytes = txBytes;
+    return counters;
+}
+
 TEST(KorvsnmpcdRates, CpuShares)
 {
     // From `after` to `backwards` only idle moved: 200 - 125.
-    korvsnmpcd::CpuTimes before{100, 0, 100, 100}, after{125, 0, 150, 125}, backwards{0, 0, 0, 200};
+    korvsnmpcd::CpuTimes before = Cpu(100, 0, 100, 100);
+    korvsnmpcd::CpuTimes after = Cpu(125, 0, 150, 125);
+    korvsnmpcd::CpuTimes backwards = Cpu(0, 0, 0, 200);
     korvsnmpcd::CpuUsage u = korvsnmpcd::CpuPercentages(before, after);
     EXPECT_THAT(Fields({u.user, u.system, u.idle}), ElementsAre(25, 50, 25));
     u = korvsnmpcd::CpuPercentages(after, backwards);
@@ -129,22 +196,26 @@ BlockCounters Block(unsigned minor, uint64_t reads, uint64_t sectors, uint64_t t
 
 TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
 {
-    Snapshot before, after; before.monotonicMs = 10000, after.monotonicMs = 12000;
+    Snapshot before;
+    Snapshot after;
+    before.monotonicMs = 10000;
+    after.monotonicMs = 12000;
     before.blocks = {{"sda", Block(0, 10, 100)}, {"sdb", Block(16, 5, 5)}, {"sdc", Block(32, 9, 9)}};
-    before.interfaces = {{"eth0", {1000, 2000}}, {"eth1", {1, 1}}};
+    before.interfaces = {{"eth0", Traffic(1000, 2000)}, {"eth1", Traffic(1, 1)}};
     // sda steady, sdc replaced by another device, sdd new.
     after.blocks = {{"sda", Block(0, 30, 300, 1000)}, {"sdc", Block(48, 999999, 999999)},
                     {"sdd", Block(64, 500000, 500000)}};
-    after.disks = {"sda", "sdc", "sdd"}, after.mounted = {"sda", "sdd", "sdx"};  // sdx has no counters
-    after.interfaces = {{"eth0", {3000, 2000}}, {"ppp0", {123456789, 1}}};
+    after.disks = {"sda", "sdc", "sdd"};
+    after.mounted = {"sda", "sdd", "sdx"};  // sdx has no counters
+    after.interfaces = {{"eth0", Traffic(3000, 2000)}, {"ppp0", Traffic(123456789, 1)}};
 
     korvsnmpcd::Rates rates = korvsnmpcd::ComputeRates(before, after);
     ASSERT_EQ(rates.disks.size(), 3u);
     for (const char *disk : {"sda", "sdc", "sdd"}) {
         const korvsnmpcd::BlockRates &r = rates.disks.at(disk);
-        std::vector<uint64_t> steady = {10, 100 * 512, 20, 200 * 512, 50};
+        std::vector<Counter> steady = {10, 100 * 512, 20, 200 * 512, 50};
         EXPECT_EQ(Fields({r.readAccess, r.readByte, r.writeAccess, r.writeByte, r.utilization}),
-                  disk == std::string("sda") ? steady : std::vector<uint64_t>(5, 0)) << disk;
+                  disk == std::string("sda") ? steady : std::vector<Counter>(5, 0)) << disk;
     }
     ASSERT_EQ(rates.spaces.size(), 2u);  // sda and sdd
     // The utilization is the mean of 50 and 0.
@@ -154,7 +225,8 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
                 ElementsAre(1000, 0, 0, 0));
 
     before.blocks = {{"sda", Block(0, 0, 0)}, {"sdb", Block(16, 0, 0)}};  // totals clamp, not wrap
-    before.monotonicMs = after.monotonicMs - 1000, after.mounted = {"sda", "sdb"};
+    before.monotonicMs = after.monotonicMs - 1000;
+    after.mounted = {"sda", "sdb"};
     after.blocks = {{"sda", Block(0, 3000000000u, 0)}, {"sdb", Block(16, 3000000000u, 0)}};
     rates = korvsnmpcd::ComputeRates(before, after);
     EXPECT_THAT(Fields({rates.spaces.at("sda").writeAccess, rates.spaceTotal.readAccess}),
@@ -166,10 +238,13 @@ TEST(KorvsnmpcdRates, DevicesComingAndGoingGiveNoSpike)
 TEST(KorvsnmpcdReply, StatisticsSections)
 {
     korvsnmpcd::Rates rates;
-    rates.interfaces["eth0"] = {7, 8}, rates.disks["sda"] = {1, 2, 3, 4, 5};
-    rates.spaces["sda1"] = {6, 7, 8, 9, 10}, rates.spaceTotal = {6, 7, 8, 9, 10};
-    Snapshot sample;
-    sample.memory.totalKiB = 8000000000ull, sample.epochSeconds = 1700000000;  // memory beyond 32 bits: clamped
+    rates.interfaces["eth0"] = {7, 8};
+    rates.disks["sda"] = {1, 2, 3, 4, 5};
+    rates.spaces["sda1"] = {6, 7, 8, 9, 10};
+    rates.spaceTotal = {6, 7, 8, 9, 10};
+    Snapshot sample;  // without counters: a reply without counter members
+    sample.memory.totalKiB = 8000000000ull;  // beyond 32 bits: clamped
+    sample.epochSeconds = 1700000000;
 
     const Json::Value data = korvsnmpcd::StatisticsReply(rates, sample)["data"];
     EXPECT_EQ(data["Memory"][0]["total_real"].asUInt(), kUint32Max);

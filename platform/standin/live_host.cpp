@@ -9,6 +9,8 @@
 #include <set>
 #include <sstream>
 
+#include "protocol/lio_target.h"
+
 namespace korvstandin::live {
 namespace {
 
@@ -218,14 +220,13 @@ void ProbeSpaces(const std::string &root, HostDescription &host)
 
 void ProbeLuns(const std::string &root, HostDescription &host)
 {
-    const fs::path core = fs::path(root + "/sys/kernel/config/target/core");
+    const fs::path core = fs::path(root + "/sys") / korvproto::kLioCoreDirectory;
     for (const std::string &hba : ListDirectory(core)) {
         for (const std::string &backstore : ListDirectory(core / hba)) {
-            std::string serial = ReadTrimmed(core / hba / backstore / "wwn/vpd_unit_serial");
-            size_t colon = serial.rfind(':');
-            if (colon == std::string::npos)
+            std::string serial;
+            if (!ReadFile(core / hba / backstore / korvproto::kLioUnitSerialFile, serial))
                 continue;
-            std::string uuid = Trim(serial.substr(colon + 1));
+            std::string uuid = korvproto::LunUuidOfUnitSerial(serial);
             if (!uuid.empty())
                 host.luns.push_back({Json::Value(uuid), Json::Value(backstore)});
         }

@@ -99,6 +99,10 @@ bool ParseOptions(int argc, const char *const *argv, Options &options, std::stri
             ok = path(options.replayPath);
         } else if (name == "--record") {
             ok = path(options.server.recordPath);
+        } else if (name == "--proc-root") {
+            ok = path(options.procRoot);
+        } else if (name == "--sys-root") {
+            ok = path(options.sysRoot);
         } else if (name == "--interval" || name == "--client-timeout") {
             std::optional<std::string> text = value();
             auto seconds = text ? Seconds(name, *text, error) : std::nullopt;
@@ -148,6 +152,9 @@ void PrintUsage(FILE *to)
                  "  --max-connections N       connections served at once (default %zu)\n"
                  "  --replay FILE             answer with the reply in FILE instead of sampling\n"
                  "  --record FILE             write the next statistics reply to FILE\n"
+                 "  --proc-root DIR           read the kernel's statistics from DIR, not /proc\n"
+                 "  --sys-root DIR            read the block devices and the iSCSI target from\n"
+                 "                            DIR, not /sys\n"
                  "  --daemon                  detach once the socket is listening\n"
                  "  --foreground              stay attached and log to stderr too\n"
                  "  --pidfile PATH            write the process id to PATH\n"

@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <string>
 
+#include "sampler.h"
 #include "server.h"
 
 namespace korvsnmpcd {
@@ -18,6 +19,8 @@ struct Options {
     bool probe = false;       // only tell whether something listens on the socket path
     std::string pidFile;
     std::string replayPath;   // serve this file's reply instead of sampling
+    std::string procRoot = kProcRoot;  // what stands for /proc, for /sys
+    std::string sysRoot = kSysRoot;
 };
 
 // Reads argv[1..argc-1] into `options`: "--name value" or "--name=value".

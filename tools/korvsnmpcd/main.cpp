@@ -125,7 +125,8 @@ int main(int argc, char **argv)
     if (options.detach) {
         CloseInheritedDescriptors();
         for (std::string *path : {&options.server.socketPath, &options.server.recordPath,
-                                  &options.pidFile, &options.replayPath})
+                                  &options.pidFile, &options.replayPath, &options.procRoot,
+                                  &options.sysRoot})
             MakeAbsolute(*path);
     }
 
@@ -155,7 +156,8 @@ int main(int argc, char **argv)
     if (!server.Listen())
         return EXIT_FAILURE;
     if (!source)
-        source = std::make_unique<korvsnmpcd::Sampler>();
+        source = std::make_unique<korvsnmpcd::Sampler>(
+            korvsnmpcd::SourcePathsUnder(options.procRoot, options.sysRoot));
 
     korvsnmpcd::PidFile pidFile;
     if (!options.pidFile.empty() && !pidFile.Create(options.pidFile))

@@ -2,13 +2,15 @@
 
 #include <cctype>
 #include <cstdlib>
+#include <iterator>
 
 namespace korvsnmpcd {
 namespace {
 
 constexpr size_t kCpuFields = 8;            // user nice system idle iowait irq softirq steal
-constexpr size_t kNetDevRxBytesField = 0;   // after "name:"
-constexpr size_t kNetDevTxBytesField = 8;
+constexpr size_t kCpuMinFields = 4;         // up to idle, on the oldest kernels
+constexpr size_t kNetDevMinFields = 12;     // after "name:", up to the transmit drops
+constexpr size_t kNetDevTxFirstField = 8;   // rx: bytes packets errs drop fifo frame compressed multicast
 constexpr size_t kDiskStatsMinFields = 14;  // major minor name and eleven counters
 constexpr int kOctalEscapeDigits = 3;
 constexpr int kOctalBase = 8;
@@ -61,31 +63,42 @@ bool ToNumber(std::string_view field, uint64_t &value)
     return true;
 }
 
-uint64_t NumberOrZero(std::string_view field)
+// Field `index` of `fields` (counted from 1 after the key) as a counter.
+Counter CounterField(const std::vector<std::string_view> &fields, size_t index, std::string_view key,
+                     UnreadableFields *unreadable)
 {
     uint64_t value = 0;
-    return ToNumber(field, value) ? value : 0;
+    if (ToNumber(fields[index], value))
+        return value;
+    if (unreadable != nullptr)
+        unreadable->Note(key, index, fields[index]);
+    return std::nullopt;
 }
 
 }  // namespace
 
-bool ParseCpuTimes(std::string_view text, CpuTimes &times)
+void UnreadableFields::Note(std::string_view key, size_t field, std::string_view text)
 {
+    if (count++ == 0)
+        first = "line [" + std::string(key) + "] field " + std::to_string(field) + " [" +
+                std::string(text) + "]";
+}
+
+bool ParseCpuTimes(std::string_view text, CpuTimes &times, UnreadableFields *unreadable)
+{
+    Counter CpuTimes::*const states[kCpuFields] = {
+        &CpuTimes::user, &CpuTimes::nice, &CpuTimes::system,  &CpuTimes::idle,
+        &CpuTimes::iowait, &CpuTimes::irq, &CpuTimes::softirq, &CpuTimes::steal};
     for (std::string_view line : Lines(text)) {
         std::vector<std::string_view> fields = Fields(line);
         if (fields.empty() || fields[0] != "cpu")
             continue;
-        // Older kernels have fewer columns; the missing ones count as 0.
-        uint64_t values[kCpuFields] = {};
-        size_t present = fields.size() - 1;
-        if (present < 4)
+        if (fields.size() - 1 < kCpuMinFields)
             return false;
-        for (size_t i = 0; i < kCpuFields && i < present; ++i) {
-            if (!ToNumber(fields[i + 1], values[i]))
-                return false;
-        }
-        times = CpuTimes{values[0], values[1], values[2], values[3],
-                         values[4], values[5], values[6], values[7]};
+        CpuTimes parsed;
+        for (size_t i = 0; i < kCpuFields && i + 1 < fields.size(); ++i)
+            parsed.*states[i] = CounterField(fields, i + 1, fields[0], unreadable);
+        times = parsed;
         return true;
     }
     return false;
@@ -119,8 +132,14 @@ bool ParseMemoryInfo(std::string_view text, MemoryInfo &memory)
     return true;
 }
 
-std::map<std::string, InterfaceCounters> ParseNetDev(std::string_view text)
+std::map<std::string, InterfaceCounters> ParseNetDev(std::string_view text,
+                                                     UnreadableFields *unreadable)
 {
+    // Bytes, packets, errors and drops lead each direction's fields.
+    Counter InterfaceCounters::*const rx[] = {&InterfaceCounters::rxBytes, &InterfaceCounters::rxPackets,
+                                              &InterfaceCounters::rxErrors, &InterfaceCounters::rxDrops};
+    Counter InterfaceCounters::*const tx[] = {&InterfaceCounters::txBytes, &InterfaceCounters::txPackets,
+                                              &InterfaceCounters::txErrors, &InterfaceCounters::txDrops};
     std::map<std::string, InterfaceCounters> interfaces;
     for (std::string_view line : Lines(text)) {
         // "  eth0: 123 ..." or, with long counters, "eth0:123 ...": the name ends at the colon.
@@ -129,18 +148,22 @@ std::map<std::string, InterfaceCounters> ParseNetDev(std::string_view text)
             continue;
         std::vector<std::string_view> name = Fields(line.substr(0, colon));
         std::vector<std::string_view> counters = Fields(line.substr(colon + 1));
-        if (name.size() != 1 || counters.size() <= kNetDevTxBytesField)
+        if (name.size() != 1 || counters.size() < kNetDevMinFields)
             continue;
+        // Numbered from 1 after the name, as in the unreadable fields' descriptions.
+        counters.insert(counters.begin(), name[0]);
         InterfaceCounters parsed;
-        if (!ToNumber(counters[kNetDevRxBytesField], parsed.rxBytes) ||
-            !ToNumber(counters[kNetDevTxBytesField], parsed.txBytes))
-            continue;
+        for (size_t i = 0; i < std::size(rx); ++i) {
+            parsed.*rx[i] = CounterField(counters, 1 + i, name[0], unreadable);
+            parsed.*tx[i] = CounterField(counters, 1 + kNetDevTxFirstField + i, name[0], unreadable);
+        }
         interfaces[std::string(name[0])] = parsed;
     }
     return interfaces;
 }
 
-std::map<std::string, BlockCounters> ParseDiskStats(std::string_view text)
+std::map<std::string, BlockCounters> ParseDiskStats(std::string_view text,
+                                                     UnreadableFields *unreadable)
 {
     enum Field { kMajor, kMinor, kName, kReads, kReadsMerged, kSectorsRead, kReadMs,
                  kWrites, kWritesMerged, kSectorsWritten, kWriteMs, kInFlight, kIoTicks };
@@ -157,29 +180,46 @@ std::map<std::string, BlockCounters> ParseDiskStats(std::string_view text)
         BlockCounters parsed;
         parsed.major = static_cast<unsigned>(major);
         parsed.minor = static_cast<unsigned>(minor);
-        parsed.reads = NumberOrZero(fields[kReads]);
-        parsed.sectorsRead = NumberOrZero(fields[kSectorsRead]);
-        parsed.writes = NumberOrZero(fields[kWrites]);
-        parsed.sectorsWritten = NumberOrZero(fields[kSectorsWritten]);
-        parsed.ioTicksMs = NumberOrZero(fields[kIoTicks]);
+        // Numbered from 1 after the name, as in the unreadable fields' descriptions.
+        const std::vector<std::string_view> counters(fields.begin() + kName, fields.end());
+        const auto counter = [&](size_t field) {
+            return CounterField(counters, field - kName, fields[kName], unreadable);
+        };
+        parsed.reads = counter(kReads);
+        parsed.sectorsRead = counter(kSectorsRead);
+        parsed.writes = counter(kWrites);
+        parsed.sectorsWritten = counter(kSectorsWritten);
+        parsed.ioTicksMs = counter(kIoTicks);
         devices[std::string(fields[kName])] = parsed;
     }
     return devices;
 }
 
-NfsServerCounters ParseNfsServer(std::string_view text)
+NfsServerCounters ParseNfsServer(std::string_view text, UnreadableFields *unreadable)
 {
     NfsServerCounters counters;
     for (std::string_view line : Lines(text)) {
         std::vector<std::string_view> fields = Fields(line);
         if (fields.size() >= 3 && fields[0] == "io") {
-            counters.readBytes = NumberOrZero(fields[1]);
-            counters.writtenBytes = NumberOrZero(fields[2]);
+            counters.readBytes = CounterField(fields, 1, fields[0], unreadable);
+            counters.writtenBytes = CounterField(fields, 2, fields[0], unreadable);
         } else if (fields.size() >= 2 && fields[0] == "rpc") {
-            counters.rpcCalls = NumberOrZero(fields[1]);
+            counters.rpcCalls = CounterField(fields, 1, fields[0], unreadable);
         }
     }
     return counters;
+}
+
+Counter ParseSingleNumber(std::string_view text, std::string_view key, UnreadableFields *unreadable)
+{
+    std::vector<std::string_view> fields = Fields(text.substr(0, text.find('\n')));
+    if (fields.size() != 1) {
+        if (unreadable != nullptr)
+            unreadable->Note(key, 1, text.substr(0, text.find('\n')));
+        return std::nullopt;
+    }
+    fields.insert(fields.begin(), key);
+    return CounterField(fields, 1, key, unreadable);
 }
 
 std::vector<std::string> ParseMountSources(std::string_view text)

@@ -9,12 +9,17 @@ namespace {
 
 constexpr uint64_t kMsPerSecond = 1000;
 constexpr uint64_t kPercent = 100;
-constexpr uint64_t kSectorBytes = 512;
+constexpr uint64_t kMebibyte = 1048576;
 constexpr uint64_t kRateMax = std::numeric_limits<uint32_t>::max();
 
 uint64_t Increase(uint64_t before, uint64_t after)
 {
     return after >= before ? after - before : 0;
+}
+
+uint64_t Increase(const Counter &before, const Counter &after)
+{
+    return before && after ? Increase(*before, *after) : 0;
 }
 
 uint32_t Clamp(uint64_t value)
@@ -32,6 +37,13 @@ uint32_t RatePerSecond(uint64_t increase, uint64_t elapsedMs)
     return Clamp((increase * kMsPerSecond + elapsedMs / 2) / elapsedMs);
 }
 
+// The rate of a counter of `unit`-byte units, in bytes per second.
+uint32_t ByteRate(const Counter &before, const Counter &after, uint64_t unit, uint64_t elapsedMs)
+{
+    const uint64_t limit = std::numeric_limits<uint64_t>::max() / unit;
+    return RatePerSecond(std::min(Increase(before, after), limit) * unit, elapsedMs);
+}
+
 uint32_t SaturatingAdd(uint32_t a, uint32_t b)
 {
     return Clamp(uint64_t{a} + b);
@@ -41,15 +53,12 @@ BlockRates BlockRatesBetween(const BlockCounters &before, const BlockCounters &a
                              uint64_t elapsedMs)
 {
     BlockRates rates;
-    rates.utilization = BusyPercent(before.ioTicksMs, after.ioTicksMs, elapsedMs);
+    if (before.ioTicksMs && after.ioTicksMs)
+        rates.utilization = BusyPercent(*before.ioTicksMs, *after.ioTicksMs, elapsedMs);
     rates.readAccess = CounterRate(before.reads, after.reads, elapsedMs);
     rates.writeAccess = CounterRate(before.writes, after.writes, elapsedMs);
-    uint64_t sectorsRead = Increase(before.sectorsRead, after.sectorsRead);
-    uint64_t sectorsWritten = Increase(before.sectorsWritten, after.sectorsWritten);
-    constexpr uint64_t kSectorLimit = std::numeric_limits<uint64_t>::max() / kSectorBytes;
-    rates.readByte = RatePerSecond(std::min(sectorsRead, kSectorLimit) * kSectorBytes, elapsedMs);
-    rates.writeByte =
-        RatePerSecond(std::min(sectorsWritten, kSectorLimit) * kSectorBytes, elapsedMs);
+    rates.readByte = ByteRate(before.sectorsRead, after.sectorsRead, kDiskStatsSectorBytes, elapsedMs);
+    rates.writeByte = ByteRate(before.sectorsWritten, after.sectorsWritten, kDiskStatsSectorBytes, elapsedMs);
     return rates;
 }
 
@@ -79,6 +88,11 @@ uint32_t CounterRate(uint64_t before, uint64_t after, uint64_t elapsedMs)
     return RatePerSecond(Increase(before, after), elapsedMs);
 }
 
+uint32_t CounterRate(const Counter &before, const Counter &after, uint64_t elapsedMs)
+{
+    return RatePerSecond(Increase(before, after), elapsedMs);
+}
+
 uint32_t BusyPercent(uint64_t beforeMs, uint64_t afterMs, uint64_t elapsedMs)
 {
     if (elapsedMs == 0)
@@ -89,7 +103,7 @@ uint32_t BusyPercent(uint64_t beforeMs, uint64_t afterMs, uint64_t elapsedMs)
 
 CpuUsage CpuPercentages(const CpuTimes &before, const CpuTimes &after)
 {
-    uint64_t CpuTimes::*const states[] = {&CpuTimes::user,   &CpuTimes::nice,    &CpuTimes::system,
+    Counter CpuTimes::*const states[] = {&CpuTimes::user,   &CpuTimes::nice,    &CpuTimes::system,
                                           &CpuTimes::idle,   &CpuTimes::iowait,  &CpuTimes::irq,
                                           &CpuTimes::softirq, &CpuTimes::steal};
     uint32_t CpuUsage::*const shares[] = {&CpuUsage::user,   &CpuUsage::nice,    &CpuUsage::system,
@@ -146,6 +160,15 @@ Rates ComputeRates(const Snapshot &before, const Snapshot &after)
     rates.nfs.readByte = CounterRate(before.nfs.readBytes, after.nfs.readBytes, elapsedMs);
     rates.nfs.writeByte = CounterRate(before.nfs.writtenBytes, after.nfs.writtenBytes, elapsedMs);
     rates.nfs.calls = CounterRate(before.nfs.rpcCalls, after.nfs.rpcCalls, elapsedMs);
+
+    for (const auto &[uuid, now] : after.luns) {
+        auto then = before.luns.find(uuid);
+        LunRates &lun = rates.luns[uuid];
+        if (then == before.luns.end())
+            continue;
+        lun.readByte = ByteRate(then->second.readMbytes, now.readMbytes, kMebibyte, elapsedMs);
+        lun.writeByte = ByteRate(then->second.writeMbytes, now.writeMbytes, kMebibyte, elapsedMs);
+    }
     return rates;
 }
 
