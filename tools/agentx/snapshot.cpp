@@ -148,6 +148,7 @@ public:
                                              Counters counters, const Sums *sums = nullptr)
     {
         const uint32_t group = korvcatalogue::SnmpGroupOf(section);
+        seen_.insert({group, index});  // a row without counters now keeps those last seen
         std::map<std::string, uint64_t> found;
         std::map<uint32_t, uint64_t> byNumber;
         const Statistic *discontinuity = nullptr;
@@ -216,8 +217,8 @@ public:
                                                                            : std::next(row);
         if (bad_ != 0 && bad_ != memory_.badCounters)
             KORVSNMP_LOG(LOG_WARNING,
-                         "%zu counter values are not integers from 0 to 2^64 - 1 and are left out, "
-                         "the first %s",
+                         "Counter values that are not integers from 0 to 2^64 - 1 are left out: "
+                         "%zu in this sample, the first %s",
                          bad_, firstBad_.c_str());
         memory_.badCounters = bad_;
     }
@@ -251,7 +252,6 @@ private:
     uint32_t Discontinuity(uint32_t group, uint32_t index, const std::map<uint32_t, uint64_t> &counters)
     {
         const std::pair<uint32_t, uint32_t> key{group, index};
-        seen_.insert(key);
         auto found = memory_.rows.find(key);
         if (found == memory_.rows.end()) {
             found = memory_.rows.emplace(key, SampleMemory::Counters{}).first;
