@@ -9,6 +9,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <cstdio>
@@ -44,7 +45,7 @@ void PublishUpTime()
 
 uint32_t MasterUpTime()
 {
-    return static_cast<uint32_t>((SteadyNowMs() - masterStartMs.load()) / 10);
+    return static_cast<uint32_t>(std::max<int64_t>(SteadyNowMs() - masterStartMs.load(), 0) / 10);
 }
 
 void OnStop(int)

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <iterator>
 #include <optional>
+#include <set>
 
 #include "catalogue/statistics_catalogue.h"
 #include "catalogue/utf8_text.h"
@@ -393,22 +394,28 @@ const Entry *Snapshot::FindNext(const Oid &oid) const
 
 bool IsInstanceOfKnownObject(const Oid &oid)
 {
+    // The objects' OIDs below korvObjects without their instance: group.number or table.1.column.
+    static const std::set<Oid> kObjectsBelow = [] {
+        std::set<Oid> objects;
+        for (const Statistic &statistic : korvcatalogue::Statistics()) {
+            const uint32_t group = korvcatalogue::SnmpGroupOf(statistic.section);
+            if (statistic.syntax == Syntax::None || statistic.kind == Kind::Index)
+                continue;
+            if (IsTable(statistic.section))
+                objects.insert({group, kEntry, statistic.snmpNumber});
+            else
+                objects.insert({group, statistic.snmpNumber});
+        }
+        return objects;
+    }();
     const Oid objects = ObjectsOid();
     const size_t at = objects.size();
     if (!StartsWith(oid, objects) || oid.size() <= at + 2)
         return false;
-    for (const Statistic &statistic : korvcatalogue::Statistics()) {
-        if (statistic.syntax == Syntax::None || statistic.kind == Kind::Index ||
-            oid[at] != korvcatalogue::SnmpGroupOf(statistic.section))
-            continue;
-        if (IsTable(statistic.section)) {
-            if (oid.size() == at + 4 && oid[at + 1] == kEntry && oid[at + 2] == statistic.snmpNumber)
-                return true;
-        } else if (oid.size() == at + 3 && oid[at + 1] == statistic.snmpNumber && oid[at + 2] == 0) {
-            return true;
-        }
-    }
-    return false;
+    const Oid below(oid.begin() + static_cast<std::ptrdiff_t>(at), oid.end() - 1);  // the instance: one arc
+    if (kObjectsBelow.count(below) == 0)
+        return false;
+    return below.size() == 3 || oid.back() == 0;
 }
 
 Snapshot BuildSnapshot(const Json::Value &result, const NetworkKinds &kinds, SampleMemory &memory,
