@@ -10,8 +10,8 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <string>
 #include <mutex>
+#include <string>
 #include <thread>
 
 #include <json/value.h>
