@@ -70,7 +70,7 @@ waitfor snmpd test -S "$dir/agentx.sock"
 
 echo "==> starting korvsnmp-agentx"
 setsid build/tools/agentx/korvsnmp-agentx --agentx-socket "$dir/agentx.sock" \
-    --persistent-dir "$dir/agentx-state" >"$dir/korvsnmp-agentx.log" 2>&1 &
+    --state-dir "$dir/agentx-state" >"$dir/korvsnmp-agentx.log" 2>&1 &
 pids="$pids $!"
 
 mibs="/usr/share/snmp/mibs/ietf:/usr/share/mibs/ietf:$top/mibs/base:$top/mibs"

@@ -1,8 +1,9 @@
 // korvsnmp-agentx under Debian's snmpd, read with net-snmp's own client
 // tools, against the test collector: every object matches the library's
-// result for the same reply; the walk answers from the last snapshot while
-// the collector stalls; the collector goes away and comes back; snmpd
-// restarts and the subagent registers again.
+// result for the same reply, the Counter64 counters and their sums included;
+// the walk answers from the last snapshot while the collector stalls; the
+// collector goes away and comes back; snmpd restarts and the subagent
+// registers again; a restarted subagent finds every device under its index.
 #include <netinet/in.h>
 #include <signal.h>
 #include <sys/socket.h>
@@ -24,6 +25,7 @@
 #include <korvsnmp/korvsnmp.h>
 
 #include "block_nodes.h"
+#include "catalogue/statistics_catalogue.h"
 #include "collector_process.h"
 #include "json_text.h"
 #include "korv_standin.h"
@@ -68,6 +70,16 @@ template <typename Predicate> bool PollUntil(Predicate done)
     return true;
 }
 
+// A walk without its korvSnapshotAge line, which counts the seconds that walks take.
+std::string WithoutAge(const std::string &walk)
+{
+    std::istringstream lines(walk);
+    std::string kept;
+    for (std::string line; std::getline(lines, line);)
+        if (line.rfind("korvSnapshotAge.0 = ", 0) != 0) kept += line + "\n";
+    return kept;
+}
+
 // How often `part` occurs in `text`.
 std::ptrdiff_t Occurrences(const std::string &text, const std::string &part)
 {
@@ -92,15 +104,32 @@ std::string HostDescription(const korvtest::BlockNodes &nodes)
         {"volume_disk": "Disk", "volume_expansion": "Expansion Unit", "dedicated_ssd_cache": "SSD Cache"}}})";
 }
 
-// A collector reply for that appliance; `seed` varies the counters. A device
-// that the appliance does not name (sdz, eth9) is dropped by the library.
+// The cumulative counters of a section's records, as the catalogue names them.
+std::vector<std::string> CounterMembers(korvcatalogue::Section section)
+{
+    std::vector<std::string> members;
+    for (const korvcatalogue::Statistic *statistic : korvcatalogue::StatisticsOf(section))
+        if (statistic->kind == korvcatalogue::Kind::Counter && !statistic->member.empty())
+            members.push_back(statistic->member);
+    return members;
+}
+
+// A collector reply for that appliance; `seed` varies the rates and the
+// counters (those beyond 2^32). A device that the appliance does not name
+// (sdz, eth9) is dropped by the library.
 Json::Value DescribedReply(const korvtest::BlockNodes &nodes, unsigned time, unsigned seed)
 {
-    auto record = [&, n = 0u](const std::string &device, const std::vector<std::string> &members) mutable {
+    using korvcatalogue::Section;
+    auto record = [&, n = 0u](const std::string &device, std::vector<std::string> members,
+                              Section section) mutable {
         Json::Value record(Json::objectValue);
         record["device"] = device;
+        const std::vector<std::string> counters = CounterMembers(section);
+        members.insert(members.end(), counters.begin(), counters.end());
         for (const std::string &member : members)
-            record[member] = member == "utilization" ? (seed + n * 7) % 100 : seed * 1000 + ++n * 10;
+            record[member] = member == "utilization" ? Json::UInt64((seed + n * 7) % 100)
+                : member.size() > 6 && member.compare(member.size() - 6, 6, "_total") == 0
+                ? Json::UInt64(seed) << 33 | ++n : Json::UInt64(seed * 1000 + ++n * 10);
         return record;
     };
     Json::Value reply = korvtest::ParseJson(R"({"data": {"System": [{"user": 11, "nice": 1, "system": 7,
@@ -109,12 +138,18 @@ Json::Value DescribedReply(const korvtest::BlockNodes &nodes, unsigned time, uns
         "avail_swap": 1000000}], "NFS": {"calls": 40, "read_byte": 50, "write_byte": 60}}})");
     Json::Value &data = reply["data"];
     for (const char *name : {"eth1", "eth0", "eth0.10", "bond0", "eth9", "ppp0"})
-        data["Network"].append(record(name, {"rx", "tx"}));
-    for (const char *name : {"sdc", "sda", "sdz", "sdu"}) data["DiskIO"].append(record(name, kCounters));
+        data["Network"].append(record(name, {"rx", "tx"}, Section::Interface));
+    for (const char *name : {"sdc", "sda", "sdz", "sdu"})
+        data["DiskIO"].append(record(name, kCounters, Section::Disk));
     for (std::string name : {nodes.Name(1), nodes.Name(0), std::string("total")})
-        data["SpaceIO"].append(record(name, kCounters));
+        data["SpaceIO"].append(record(name, kCounters, Section::Volume));
     for (const char *uuid : {"60014052-e000-4000-8000-000000000001", "60014052-e000-4000-8000-000000000002"})
-        data["iSCSI"].append(record(uuid, kCounters));
+        data["iSCSI"].append(record(uuid, kCounters, Section::Lun));
+    for (const auto &[section, name] : {std::pair(Section::Cpu, "System"), std::pair(Section::Nfs, "NFS")}) {
+        Json::Value &values = section == Section::Cpu ? data[name][0] : data[name];
+        for (const std::string &member : CounterMembers(section))
+            values[member] = Json::UInt64(seed) << 40 | values.size();
+    }
     data["time"] = time;
     return reply;
 }
@@ -127,6 +162,50 @@ std::string Camel(const std::string &member)
         if (member[i] != '_')
             name += i == 0 || member[i - 1] == '_' ? char(std::toupper(member[i])) : member[i];
     return name;
+}
+
+// The Counter64 objects that a walk must show for the library's result, each
+// row's or group's discontinuity time as "time": a row's own counters as the
+// library passed them on; the totals, the sums of their tables' rows modulo
+// 2^64; the interface total, the sum of the rows of kind interface; none for
+// the aggregation.
+void AddCounters(const Json::Value &result, std::map<std::string, std::string> &objects)
+{
+    using korvcatalogue::Section;
+    auto discontinuity = [](Section section) {
+        for (const korvcatalogue::Statistic *statistic : korvcatalogue::StatisticsOf(section))
+            if (statistic->kind == korvcatalogue::Kind::Discontinuity) return statistic->snmpObject;
+        return std::string("?");
+    };
+    auto add = [&](Section section, const std::string &index, const std::map<std::string, uint64_t> &counters) {
+        for (const auto &[member, value] : counters)
+            objects[korvcatalogue::Find(section, member)->snmpObject + index] = std::to_string(value);
+        if (!counters.empty()) objects[discontinuity(section) + index] = "time";
+    };
+    auto countersOf = [](Section section, const Json::Value &record) {
+        std::map<std::string, uint64_t> counters;
+        for (const std::string &member : CounterMembers(section))
+            if (record.isMember(member)) counters[member] = record[member].asUInt64();
+        return counters;
+    };
+    add(Section::Cpu, ".0", countersOf(Section::Cpu, result["cpu"]));
+    add(Section::Nfs, ".0", countersOf(Section::Nfs, result["nfs"]));
+    const std::tuple<Section, Json::Value, Section> tables[] = {
+        {Section::Disk, result["disk"]["disk"], Section::DiskTotal},
+        {Section::Volume, result["space"]["volume"], Section::VolumeTotal},
+        {Section::Lun, result["lun"], Section::Lun}, {Section::Interface, result["network"], Section::Interface}};
+    for (const auto &[section, rows, total] : tables) {
+        std::map<std::string, uint64_t> sums;
+        for (Json::ArrayIndex row = 0; row < rows.size(); ++row) {
+            const std::string device = rows[row]["device"].asString();
+            if (section == Section::Interface && (row == 0 || device == "bond0")) continue;
+            add(section, "." + std::to_string(row + 1), countersOf(section, rows[row]));
+            if (device == "ppp0") continue;
+            for (const auto &[member, value] : countersOf(section, rows[row])) sums[member] += value;
+        }
+        if (total != section) add(total, ".0", sums);
+        if (section == Section::Interface) add(section, ".1", sums);
+    }
 }
 
 // The objects (values without their types) that a walk must show for the library's result of the
@@ -167,6 +246,7 @@ std::map<std::string, std::string> ExpectedObjects(const Json::Value &result)
                 objects["korvIfKind" + index] = row == 0 ? "1" : device == "bond0" ? "3" : device.rfind("ppp0", 0) == 0 ? "4" : "2";
         }
     }
+    AddCounters(result, objects);
     return objects;
 }
 
@@ -205,7 +285,7 @@ protected:
         words.insert(words.end(), {"SNMP_PERSISTENT_DIR=" + Path("state"),
             "KORVPLATFORM_HOST=" + Path("host.json"),
             KORVSNMP_AGENTX_PATH, "--agentx-socket", Path("agentx.sock"), "--interval", "3600",
-            "--ping-interval", "1", "--persistent-dir", Path("state")});
+            "--ping-interval", "1", "--state-dir", Path("state")});
         subagent_.reset();
         subagent_.emplace("/usr/bin/env", words, Path("agentx.out"));
         ASSERT_TRUE(WaitForSample(time)) << subagent_->Log();
@@ -256,9 +336,24 @@ protected:
             if (equals == std::string::npos) objects["?" + line] = "";
             else if (line.find(" = No more variables", equals) != equals && line.rfind("korvSnapshotAge", 0) != 0 &&
                      line.rfind("korvFailedSamples", 0) != 0)
-                objects[line.substr(0, equals)] = line.substr(line.find(": ", equals) + 2);
+                objects[line.substr(0, equals)] = line.find("DiscontinuityTime") < equals &&
+                    line.find(" = Timeticks: (") == equals ? "time" : line.substr(line.find(": ", equals) + 2);
         }
         return objects;
+    }
+
+    // The index of each device in a walk, by its naming object: "korvDiskDevice.3 = STRING: sda" gives
+    // "korvDiskDevice sda" -> "3".
+    static std::map<std::string, std::string> IndexesOf(const std::string &walk)
+    {
+        std::map<std::string, std::string> indexes;
+        for (const auto &[object, value] : Objects(walk)) {
+            const size_t dot = object.find('.');
+            const std::string name = object.substr(0, dot);
+            if (name == "korvDiskDevice" || name == "korvIfDevice" || name == "korvVolumeDevice" || name == "korvLunUuid")
+                indexes[name + " " + value] = object.substr(dot + 1);
+        }
+        return indexes;
     }
 
     korvtest::BlockNodes nodes_;
@@ -274,14 +369,17 @@ TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndARestartedSnmpdFindsTh
     StartSubagent(1795000000);
 
     const std::string walk = Client("snmpwalk", "korvsnmpMIB");
-    EXPECT_THAT(Objects(walk), ::testing::ContainerEq(ExpectedObjects(LibraryResult(reply)))) << walk;
+    const Json::Value result = LibraryResult(reply);
+    EXPECT_THAT(Objects(walk), ::testing::ContainerEq(ExpectedObjects(result))) << walk;
+    EXPECT_THAT(walk, ::testing::HasSubstr("korvDiskReadByteTotal.1 = Counter64: "));
     EXPECT_THAT(walk, ::testing::EndsWith(kEndOfView));
-    EXPECT_EQ(Client("snmpbulkwalk", "-Cr7 korvsnmpMIB"), walk);
+    EXPECT_EQ(WithoutAge(Client("snmpbulkwalk", "-Cr7 korvsnmpMIB")), WithoutAge(walk));
 
     const std::tuple<const char *, const char *, std::string> edges[] = {
         {"snmpget", "korvDiskDevice.999", "korvDiskDevice.999 = No Such Instance currently exists at this OID\n"},
         {"snmpget", "korvObjects.99.0", "korvObjects.99.0 = No Such Object available on this agent at this OID\n"},
-        {"snmpgetnext", "korvLunWriteByte.2", std::string("korvLunWriteByte.2") + kEndOfView},
+        {"snmpgetnext", "korvLunDiscontinuityTime.2", std::string("korvLunDiscontinuityTime.2") + kEndOfView},
+        {"snmpgetnext", "korvLunWriteByte.2", "korvLunCommandTotal.1 = " + result["lun"][0]["command_total"].asString() + "\n"},
         {"snmpgetnext", "korvLunTable.9", std::string("korvLunTable.9") + kEndOfView},
         {"snmpgetnext", "korvSampleTime", "korvSampleTime.0 = 1795000000\n"}};
     for (const auto &[tool, arguments, expected] : edges)
@@ -326,6 +424,36 @@ TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCounte
     // Stalled again: SIGTERM stops it within the process wait, not the library's 90 s.
     StallASample();
     EXPECT_EQ(subagent_->Stop(SIGTERM), 0) << subagent_->Log();
+}
+
+TEST_F(AgentxUnderSnmpd, ARestartedSubagentFindsEveryDeviceUnderItsIndexAndANewOneUnderANewIndex)
+{
+    collector_->Script({korvtest::Frame(korvtest::JsonText(DescribedReply(nodes_, 1795000000, 1)))});
+    StartSubagent(1795000000);
+    const std::map<std::string, std::string> before = IndexesOf(Client("snmpwalk", "korvsnmpMIB"));
+    ASSERT_EQ(before.size(), 13u) << Client("snmpwalk", "korvsnmpMIB");  // 3 disks, 6 interface rows, 2 volumes, 2 LUNs
+    EXPECT_EQ(subagent_->Stop(SIGTERM), 0) << subagent_->Log();
+    EXPECT_TRUE(fs::exists(Path("state") + std::string("/row-indexes")));
+
+    // The next run's collector lacks the first device of each section, so that the rows come in another
+    // order, and has one LUN more.
+    Json::Value reply = DescribedReply(nodes_, 1795000060, 2);
+    for (const char *section : {"Network", "DiskIO", "SpaceIO", "iSCSI"}) {
+        Json::Value removed;
+        reply["data"][section].removeIndex(0, &removed);
+    }
+    const std::string newLun = "60014052-e000-4000-8000-000000000003";
+    reply["data"]["iSCSI"].append(reply["data"]["iSCSI"][0]);
+    reply["data"]["iSCSI"][1]["device"] = newLun;
+    collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
+    StartSubagent(1795000060);
+    std::map<std::string, std::string> after = IndexesOf(Client("snmpwalk", "korvsnmpMIB"));
+    ASSERT_EQ(after.count("korvLunUuid " + newLun), 1u);
+    EXPECT_EQ(after["korvLunUuid " + newLun], "3");  // after the two of the first run
+    after.erase("korvLunUuid " + newLun);
+    EXPECT_EQ(after.size(), 9u);
+    for (const auto &[device, index] : after)
+        EXPECT_EQ(before.count(device) ? before.at(device) : "none", index) << device;
 }
 
 }  // namespace

@@ -64,12 +64,14 @@ void AddBlockCounters(std::vector<Statistic> &all, Section section, const std::s
                    "Time with I/O in flight"});
 }
 
+// A table's discontinuity column, or a group's discontinuity scalar.
 void AddDiscontinuity(std::vector<Statistic> &all, Section section, const std::string &object,
-                      uint32_t column)
+                      uint32_t number, bool row = true)
 {
-    all.push_back({section, "", K::Discontinuity, U::TimeTicks, object + "DiscontinuityTime", column,
+    all.push_back({section, "", K::Discontinuity, U::TimeTicks, object + "DiscontinuityTime", number,
                    X::TimeStamp, "", "", "disc",
-                   "sysUpTime when the row appeared or one of its counters went back"});
+                   row ? "sysUpTime when the row appeared or one of its counters went back"
+                       : "sysUpTime when the counters were first served or one of them went back"});
 }
 
 void AddCpu(std::vector<Statistic> &all)
@@ -124,6 +126,7 @@ const std::vector<Statistic> &Statistics()
 
         };
         AddCpu(all);
+        AddDiscontinuity(all, S::Cpu, "korvCpu", 17, false);
         all.insert(all.end(), {
             // korvMemory: sizes at the sample.
             {S::Memory, "memory_size", K::Gauge, U::KiB, "korvMemorySize", 1, X::Gauge32,
@@ -159,10 +162,12 @@ const std::vector<Statistic> &Statistics()
             {S::Nfs, "write_byte_total", K::Counter, U::Bytes, "korvNfsWriteByteTotal", 6, X::Counter64,
              "korvsnmp_nfs_write_bytes", "", "wbytes", "Bytes written by NFS clients"},
         });
+        AddDiscontinuity(all, S::Nfs, "korvNfs", 7, false);
 
         // korvDiskTotal: the "total" record, then the 64-bit sums of the rows' counters.
         AddDeviceRates(all, S::DiskTotal, "korvDiskTotal", 1, X::CounterBasedGauge64, "");
         AddBlockCounters(all, S::DiskTotal, "korvDiskTotal", 6, "");
+        AddDiscontinuity(all, S::DiskTotal, "korvDiskTotal", 11, false);
         // korvDiskTable.
         AddIndex(all, S::Disk, "korvDisk");
         AddName(all, S::Disk, "device", "korvDiskDevice", 2, "device", "The disk's kernel name");
@@ -219,6 +224,7 @@ const std::vector<Statistic> &Statistics()
         // korvVolumeTotal and korvVolumeTable.
         AddDeviceRates(all, S::VolumeTotal, "korvVolumeTotal", 1, X::CounterBasedGauge64, "");
         AddBlockCounters(all, S::VolumeTotal, "korvVolumeTotal", 6, "");
+        AddDiscontinuity(all, S::VolumeTotal, "korvVolumeTotal", 11, false);
         AddIndex(all, S::Volume, "korvVolume");
         AddName(all, S::Volume, "device", "korvVolumeDevice", 2, "device",
                 "The kernel name of the block device that carries the volume");
@@ -292,6 +298,25 @@ const char *ResultMemberOf(Section section)
     case S::VolumeTotal:
     case S::Volume: return "space";
     case S::Lun: return "lun";
+    }
+    return "";
+}
+
+const char *UnitWordOf(Unit unit)
+{
+    switch (unit) {
+    case U::None: return "";
+    case U::Percent: return "percent";
+    case U::PerSecond: return "per second";
+    case U::BytesPerSecond: return "bytes per second";
+    case U::KiB: return "KiB";
+    case U::Bytes: return "bytes";
+    case U::Operations: return "number of";
+    case U::Milliseconds: return "milliseconds";
+    case U::ClockTicks: return "clock ticks";
+    case U::MiB: return "MiB";
+    case U::Seconds: return "seconds";
+    case U::TimeTicks: return "hundredths of a second";
     }
     return "";
 }

@@ -97,6 +97,11 @@ const Statistic *Find(Section section, const std::string &member);
 // a section's objects.
 uint32_t SnmpGroupOf(Section section);
 
+// The words that name `unit` where a text gives it ("bytes", "clock ticks";
+// "number of" for a count; "" for None). Each KORVSNMP-MIB object's
+// DESCRIPTION contains its unit's words.
+const char *UnitWordOf(Unit unit);
+
 // The result's member that holds a section ("cpu", "disk", ...), and the
 // words that title it in tables and HELP texts ("Disk", "Volume total").
 const char *ResultMemberOf(Section section);

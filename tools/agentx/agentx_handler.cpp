@@ -58,6 +58,9 @@ void SetValue(netsnmp_variable_list *variable, const Value &value, const Snapsho
     case ValueType::Text:
         snmp_set_var_typed_value(variable, ASN_OCTET_STR, value.text.data(), value.text.size());
         break;
+    case ValueType::TimeStamp:
+        setUnsigned(ASN_TIMETICKS, value.number);
+        break;
     case ValueType::SnapshotAge: {
         auto age = std::chrono::duration_cast<std::chrono::seconds>(
             std::chrono::steady_clock::now() - snapshot.taken);

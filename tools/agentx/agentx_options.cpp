@@ -26,14 +26,16 @@ bool ParseSeconds(const std::string &text, uint32_t &seconds)
 
 const char kUsage[] =
     "Usage: korvsnmp-agentx [--agentx-socket PATH] [--interval SECONDS]\n"
-    "                       [--ping-interval SECONDS] [--persistent-dir DIR]\n"
+    "                       [--ping-interval SECONDS] [--state-dir DIR]\n"
     "\n"
     "An AgentX subagent that serves KORVSNMP-MIB from libkorvsnmp's statistics.\n"
     "  --agentx-socket PATH     the master agent's AgentX socket (/var/agentx/master)\n"
     "  --interval SECONDS       time between samples, 1-86400 (5)\n"
     "  --ping-interval SECONDS  how often the master is pinged, to find a restarted\n"
     "                           one again, 1-86400 (5)\n"
-    "  --persistent-dir DIR     net-snmp's state directory (/var/lib/korvsnmp-agentx)\n"
+    "  --state-dir DIR          where the row indexes and net-snmp's state are kept\n"
+    "                           (/var/lib/korvsnmp-agentx); --persistent-dir is\n"
+    "                           an older name of it\n"
     "SIGHUP takes a sample at once; SIGTERM or SIGINT stops it.\n";
 
 bool ParseOptions(const std::vector<std::string> &arguments, Options &options, std::string &error)
@@ -45,7 +47,8 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
             continue;
         }
         const bool takesValue = argument == "--agentx-socket" || argument == "--interval" ||
-                                argument == "--ping-interval" || argument == "--persistent-dir";
+                                argument == "--ping-interval" || argument == "--state-dir" ||
+                                argument == "--persistent-dir";
         if (!takesValue) {
             error = "unknown argument \"" + argument + "\"";
             return false;
@@ -55,12 +58,12 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
             return false;
         }
         const std::string &value = arguments[++i];
-        if (argument == "--agentx-socket" || argument == "--persistent-dir") {
+        if (argument == "--agentx-socket" || argument == "--state-dir" || argument == "--persistent-dir") {
             if (value.empty()) {
                 error = argument + " needs a non-empty value";
                 return false;
             }
-            (argument == "--agentx-socket" ? options.agentxSocket : options.persistentDir) = value;
+            (argument == "--agentx-socket" ? options.agentxSocket : options.stateDir) = value;
         } else if (!ParseSeconds(value, argument == "--interval" ? options.intervalSeconds
                                                                  : options.pingSeconds)) {
             error = argument + " wants whole seconds from 1 to 86400, not \"" + value + "\"";

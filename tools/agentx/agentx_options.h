@@ -12,7 +12,8 @@ struct Options {
     std::string agentxSocket = "/var/agentx/master";
     uint32_t intervalSeconds = 5;
     uint32_t pingSeconds = 5;  // AgentX ping: how soon a restarted master is found again
-    std::string persistentDir = "/var/lib/korvsnmp-agentx";
+    // The state directory: the row indexes (kIndexFileName) and net-snmp's files.
+    std::string stateDir = "/var/lib/korvsnmp-agentx";
     bool help = false;
 };
 

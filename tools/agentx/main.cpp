@@ -9,6 +9,9 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <atomic>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 
@@ -23,6 +26,27 @@ constexpr char kAppName[] = "korvsnmp-agentx";
 volatile sig_atomic_t stopRequested = 0;
 int signalPipe[2] = {-1, -1};
 korvagentx::Sampler *theSampler = nullptr;
+
+// The master agent's sysUpTime for the sampling thread. net-snmp keeps its
+// own in step with the master on this thread; the thread reads the start it
+// implies, as milliseconds of the steady clock.
+using SteadyMs = std::chrono::milliseconds;
+std::atomic<int64_t> masterStartMs{0};
+
+int64_t SteadyNowMs()
+{
+    return std::chrono::duration_cast<SteadyMs>(std::chrono::steady_clock::now().time_since_epoch()).count();
+}
+
+void PublishUpTime()
+{
+    masterStartMs = SteadyNowMs() - static_cast<int64_t>(netsnmp_get_agent_uptime()) * 10;
+}
+
+uint32_t MasterUpTime()
+{
+    return static_cast<uint32_t>(std::max<int64_t>(SteadyNowMs() - masterStartMs.load(), 0) / 10);
+}
 
 void OnStop(int)
 {
@@ -57,12 +81,12 @@ void Configure(const korvagentx::Options &options)
     // No configuration files, no MIB files, and state only in our own place.
     netsnmp_ds_set_boolean(NETSNMP_DS_LIBRARY_ID, NETSNMP_DS_LIB_DONT_READ_CONFIGS, 1);
     netsnmp_ds_set_string(NETSNMP_DS_LIBRARY_ID, NETSNMP_DS_LIB_PERSISTENT_DIR,
-                          options.persistentDir.c_str());
+                          options.stateDir.c_str());
     netsnmp_ds_set_boolean(NETSNMP_DS_LIBRARY_ID, NETSNMP_DS_LIB_DONT_PERSIST_STATE, 1);
     netsnmp_ds_set_boolean(NETSNMP_DS_LIBRARY_ID, NETSNMP_DS_LIB_DISABLE_PERSISTENT_LOAD, 1);
     netsnmp_ds_set_boolean(NETSNMP_DS_LIBRARY_ID, NETSNMP_DS_LIB_DISABLE_PERSISTENT_SAVE, 1);
     setenv("MIBS", "", 1);
-    setenv("SNMP_PERSISTENT_DIR", options.persistentDir.c_str(), 1);
+    setenv("SNMP_PERSISTENT_DIR", options.stateDir.c_str(), 1);
 }
 
 }  // namespace
@@ -93,7 +117,8 @@ int main(int argc, char **argv)
     sigaddset(&signals, SIGHUP);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
 
-    korvagentx::Sampler sampler(options.intervalSeconds);
+    PublishUpTime();
+    korvagentx::Sampler sampler(options.intervalSeconds, options.stateDir, MasterUpTime);
     theSampler = &sampler;
     if (pipe2(signalPipe, O_CLOEXEC | O_NONBLOCK) != 0) {
         std::fprintf(stderr, "%s: cannot create a pipe\n", kAppName);
@@ -107,6 +132,7 @@ int main(int argc, char **argv)
     netsnmp_ds_set_int(NETSNMP_DS_APPLICATION_ID, NETSNMP_DS_AGENT_AGENTX_PING_INTERVAL,
                        static_cast<int>(options.pingSeconds));
     register_readfd(signalPipe[0], DrainSignalPipe, nullptr);
+    PublishUpTime();
     sampler.Start();
 
     struct sigaction stop {};
@@ -119,8 +145,10 @@ int main(int argc, char **argv)
     sigaction(SIGHUP, &hangUp, nullptr);
     pthread_sigmask(SIG_UNBLOCK, &signals, nullptr);
 
-    while (registered && !stopRequested)
+    while (registered && !stopRequested) {
         agent_check_and_process(1);
+        PublishUpTime();
+    }
 
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
     sampler.Stop();

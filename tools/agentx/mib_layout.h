@@ -11,21 +11,12 @@ namespace korvagentx {
 // its place (change it here and in the MIB's MODULE-IDENTITY).
 inline constexpr uint32_t kKorvsnmpArc[] = {1, 3, 6, 1, 3, 7947};
 
-// korvObjects = arc.1; its groups and tables.
+// korvObjects = arc.1; its groups and tables are the statistics catalogue's
+// (korvcatalogue::SnmpGroupOf).
 inline constexpr uint32_t kObjects = 1;
-inline constexpr uint32_t kAgentGroup = 1;
-inline constexpr uint32_t kCpuGroup = 2;
-inline constexpr uint32_t kMemoryGroup = 3;
-inline constexpr uint32_t kNfsGroup = 4;
-inline constexpr uint32_t kDiskTotalGroup = 5;
-inline constexpr uint32_t kDiskTable = 6;
-inline constexpr uint32_t kIfTable = 7;
-inline constexpr uint32_t kVolumeTotalGroup = 8;
-inline constexpr uint32_t kVolumeTable = 9;
-inline constexpr uint32_t kLunTable = 10;
 
-// korvAgent's scalars.
-inline constexpr uint32_t kSampleTime = 1;
+// korvAgent's scalars that the front end answers itself (the catalogue's
+// korvSnapshotAge, korvFailedSamples and korvSampleInterval).
 inline constexpr uint32_t kSnapshotAge = 2;
 inline constexpr uint32_t kFailedSamples = 3;
 inline constexpr uint32_t kSampleInterval = 4;

@@ -119,11 +119,14 @@ NetworkKinds AskNetworkKinds(const Json::Value &result)
     return kinds;
 }
 
-Sampler::Sampler(uint32_t intervalSeconds) : intervalSeconds_(intervalSeconds)
+Sampler::Sampler(uint32_t intervalSeconds, const std::string &stateDirectory, std::function<uint32_t()> upTime)
+    : intervalSeconds_(intervalSeconds), upTime_(std::move(upTime)),
+      indexFile_(stateDirectory + "/" + kIndexFileName)
 {
-    TableIndexes none;
+    indexFile_.Load(memory_.indexes);
+    SampleMemory none;
     current_ = std::make_shared<const Snapshot>(BuildSnapshot(
-        Json::Value(), NetworkKinds{}, none, intervalSeconds_, std::chrono::steady_clock::now()));
+        Json::Value(), NetworkKinds{}, none, intervalSeconds_, 0, std::chrono::steady_clock::now()));
 }
 
 Sampler::~Sampler()
@@ -224,10 +227,13 @@ void Sampler::Sample()
         syslog(LOG_NOTICE, "%s:%d The collector answers again", kUnit, __LINE__);
     collectorAway_ = false;
     auto snapshot = std::make_shared<const Snapshot>(
-        BuildSnapshot(outcome.result, AskNetworkKinds(outcome.result), indexes_, intervalSeconds_,
+        BuildSnapshot(outcome.result, AskNetworkKinds(outcome.result), memory_, intervalSeconds_, upTime_(),
                       std::chrono::steady_clock::now()));
-    std::lock_guard<std::mutex> lock(mutex_);
-    current_ = std::move(snapshot);
+    {
+        std::lock_guard<std::mutex> lock(mutex_);
+        current_ = std::move(snapshot);
+    }
+    indexFile_.Save(memory_.indexes);
 }
 
 }  // namespace korvagentx

@@ -8,8 +8,10 @@
 #include <atomic>
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <mutex>
+#include <string>
 #include <thread>
 
 #include <json/value.h>
@@ -36,7 +38,10 @@ NetworkKinds AskNetworkKinds(const Json::Value &result);
 
 class Sampler {
 public:
-    explicit Sampler(uint32_t intervalSeconds);
+    // `stateDirectory` keeps the row indexes (read here, written after a
+    // sample that changed them); `upTime` gives the master agent's sysUpTime
+    // in hundredths of a second, from the sampling thread.
+    Sampler(uint32_t intervalSeconds, const std::string &stateDirectory, std::function<uint32_t()> upTime);
     ~Sampler();  // stops the thread
     Sampler(const Sampler &) = delete;
     Sampler &operator=(const Sampler &) = delete;
@@ -61,7 +66,9 @@ private:
     std::atomic<bool> running_{false};
     std::atomic<uint32_t> failed_{0};
     bool collectorAway_ = false;
-    TableIndexes indexes_;
+    const std::function<uint32_t()> upTime_;
+    SampleMemory memory_;
+    IndexFile indexFile_;
     mutable std::mutex mutex_;
     std::shared_ptr<const Snapshot> current_;
     std::thread thread_;

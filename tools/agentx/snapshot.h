@@ -2,11 +2,8 @@
 // AgentX side answers from.
 //
 // BuildSnapshot turns a result of SNMPParseReplyData (of any shape) into the
-// objects of KORVSNMP-MIB, sorted by OID. A section that is missing or of the
-// wrong shape gives no objects (an empty table); a member that is missing or
-// not a non-negative number (counters) or not a string (names) gives no
-// object for that cell. Rates wider than 32 bits are clamped to 4294967295;
-// texts are cut to a DisplayString's 255 bytes.
+// objects of KORVSNMP-MIB, as the statistics catalogue describes them,
+// sorted by OID.
 #ifndef KORVAGENTX_SNAPSHOT_H
 #define KORVAGENTX_SNAPSHOT_H
 
@@ -19,6 +16,8 @@
 
 #include <json/value.h>
 
+#include "row_indexes.h"
+
 namespace korvagentx {
 
 using Oid = std::vector<uint32_t>;
@@ -30,6 +29,7 @@ enum class ValueType {
     Counter64,
     Integer,
     Text,
+    TimeStamp,      // TimeTicks on the wire: a sysUpTime, in hundredths of a second
     SnapshotAge,    // answered from the clock: seconds since `Snapshot::taken`
     FailedSamples,  // answered from the sampler's count of failed samples
 };
@@ -68,26 +68,41 @@ struct NetworkKinds {
     std::string pppoePrefix;
 };
 
-// One table's row indexes. A key present in the previous Assign keeps its
-// index; a new key gets the next unused one (from 1 up, never reused); keys
-// missing from this Assign are forgotten.
-class RowIndexes {
-public:
-    std::vector<uint32_t> Assign(const std::vector<std::string> &keys);
-
-private:
-    std::map<std::string, uint32_t> indexes_;
-    uint32_t next_ = 1;
+// What one sample leaves to the next: the tables' row indexes (which the
+// caller may keep in an IndexFile), and for each row and each group of
+// scalars that has counters, the counters last seen and the discontinuity
+// time.
+struct SampleMemory {
+    struct Counters {
+        std::map<uint32_t, uint64_t> last;  // by column (or scalar) number
+        uint32_t discontinuity = 0;
+    };
+    TableIndexes indexes;
+    std::map<std::pair<uint32_t, uint32_t>, Counters> rows;  // (group, row index; 0 for a group)
+    size_t badCounters = 0;                                  // in the last sample, to log a change once
 };
 
-struct TableIndexes {
-    RowIndexes disk, interface, volume, lun;
-};
-
-// The snapshot of `result`, taken at `taken`, with the sampling interval in
-// seconds. `indexes` carries the row indexes from one sample to the next.
-Snapshot BuildSnapshot(const Json::Value &result, const NetworkKinds &kinds,
-                       TableIndexes &indexes, uint32_t intervalSeconds,
+// The snapshot of `result`, taken at `taken` when the master agent's
+// sysUpTime was `upTime`, with the sampling interval in seconds.
+//
+// A section that is missing or of the wrong shape gives no objects (an empty
+// table). A cell whose member is missing or of the wrong type gives no
+// object: a name must be a string (made valid UTF-8 of at most 255 bytes,
+// every invalid byte a U+FFFD); a rate, share or size a number from 0 to
+// 2^64 - 1, clamped to 4294967295 in a 32-bit object; a counter an integer
+// from 0 to 2^64 - 1 as JSON writes it (a negative, fractional, textual or
+// wider value is logged, one line for a sample whose count of such values
+// differs from the previous sample's).
+//
+// Derived counters: the total groups' counters are the sums of their
+// table's rows, and the interface total row's the sums of the rows of kind
+// interface, each present when every such row has that counter, all modulo
+// 2^64 as Counter64 wraps; aggregation rows have no counters. A row's (or a
+// group's) discontinuity time is `upTime` of the sample in which it first
+// had counters or in which one of them was lower than the last value seen;
+// a row missing from a sample starts anew. It is served with the counters.
+Snapshot BuildSnapshot(const Json::Value &result, const NetworkKinds &kinds, SampleMemory &memory,
+                       uint32_t intervalSeconds, uint32_t upTime,
                        std::chrono::steady_clock::time_point taken);
 
 }  // namespace korvagentx
