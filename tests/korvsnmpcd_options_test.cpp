@@ -48,6 +48,8 @@ TEST(KorvsnmpcdProgram, ExitStatusAndOutputOfTheCommandLine)
         {{"--client-timeout"}, kUsageError, Refused("--client-timeout needs a value")},
         {{"--max-connections=0"}, kUsageError, Refused("--max-connections [0] is not a whole number from 1 to 1000000")},
         {{"--socket="}, kUsageError, Refused("--socket needs a non-empty path")},
+        {{"--proc-root="}, kUsageError, Refused("--proc-root needs a non-empty path")},
+        {{"--sys-root"}, kUsageError, Refused("--sys-root needs a value")},
         {{"--daemon=yes"}, kUsageError, Refused("--daemon takes no value")},
         {{"--verbose"}, kUsageError, Refused("unknown option [--verbose]")},
         {{"extra"}, kUsageError, Refused("unexpected argument [extra]")},
