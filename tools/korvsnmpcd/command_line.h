@@ -18,6 +18,7 @@ struct Options {
     bool probe = false;       // only tell whether something listens on the socket path
     std::string pidFile;
     std::string replayPath;   // serve this file's reply instead of sampling
+    std::string simulatePath; // simulate the appliance whose average reply is in this file
 };
 
 // Reads argv[1..argc-1] into `options`: "--name value" or "--name=value".

@@ -19,6 +19,7 @@
 #include "reply_file.h"
 #include "sampler.h"
 #include "server.h"
+#include "simulation.h"
 #include "service_notify.h"
 #include "protocol/unique_fd.h"
 
@@ -125,7 +126,8 @@ int main(int argc, char **argv)
     if (options.detach) {
         CloseInheritedDescriptors();
         for (std::string *path : {&options.server.socketPath, &options.server.recordPath,
-                                  &options.pidFile, &options.replayPath})
+                                  &options.pidFile, &options.replayPath,
+                                  &options.simulatePath})
             MakeAbsolute(*path);
     }
 
@@ -150,6 +152,11 @@ int main(int argc, char **argv)
         if (!replay->Load())
             return EXIT_FAILURE;
         source = std::move(replay);
+    } else if (!options.simulatePath.empty()) {
+        auto simulation = std::make_unique<korvsnmpcd::Simulation>(options.simulatePath);
+        if (!simulation->Load())
+            return EXIT_FAILURE;
+        source = std::move(simulation);
     }
     korvsnmpcd::Server server(options.server);
     if (!server.Listen())
@@ -167,7 +174,11 @@ int main(int argc, char **argv)
         ready.Reset();
     }
     korvsnmpcd::NotifyReady();
-    if (options.replayPath.empty())
+    if (!options.simulatePath.empty())
+        KORVSNMP_LOG(LOG_INFO, "Listening on [%s], simulating [%s] every %lld ms",
+                     options.server.socketPath.c_str(), options.simulatePath.c_str(),
+                     static_cast<long long>(options.server.interval.count()));
+    else if (options.replayPath.empty())
         KORVSNMP_LOG(LOG_INFO, "Listening on [%s], sampling every %lld ms",
                        options.server.socketPath.c_str(),
                        static_cast<long long>(options.server.interval.count()));
