@@ -16,16 +16,18 @@
 # private directory, and korvsnmp-stat runs in a private mount namespace
 # whose /sys/dev/block has the links that name them (unshare -m).
 #
-# The environment may set KORVSNMP_BUILD (the build directory, default
-# build) and KORVSNMPCD_INTERVAL (the sampling interval of a collector
-# started here, in seconds, default 1).
+# The environment may set KORVSNMP_BUILD (a built tree to use as it is,
+# instead of building build/), KORVSNMPCD_PIDFILE (where a collector started
+# here writes its process id, default build/korvsnmpcd.pid) and
+# KORVSNMPCD_INTERVAL (the sampling interval of a collector started here, in
+# seconds, default 1).
 set -eu
 cd "$(dirname "$0")"
 
 socket=/tmp/korvsnmpcd.sock
 build=${KORVSNMP_BUILD:-build}
 interval=${KORVSNMPCD_INTERVAL:-1}
-pidfile=$build/korvsnmpcd.pid
+pidfile=${KORVSNMPCD_PIDFILE:-$build/korvsnmpcd.pid}
 stat=$build/tools/stat/korvsnmp-stat
 collector=$build/tools/korvsnmpcd/korvsnmpcd
 packages="ca-certificates cmake make g++ pkg-config libjsoncpp-dev libgtest-dev libgmock-dev libbenchmark-dev
@@ -56,9 +58,11 @@ if [ -n "$missing" ]; then
         $missing >/dev/null
 fi
 
-# CMake configures again by itself when its files changed.
-[ -f "$build/CMakeCache.txt" ] || cmake -S . -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
-cmake --build "$build" -j "$(nproc 2>/dev/null || echo 2)" --target korvsnmp-stat korvsnmpcd >/dev/null
+if [ -z "${KORVSNMP_BUILD:-}" ]; then
+    # CMake configures again by itself when its files changed.
+    [ -f "$build/CMakeCache.txt" ] || cmake -S . -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
+    cmake --build "$build" -j "$(nproc 2>/dev/null || echo 2)" --target korvsnmp-stat korvsnmpcd >/dev/null
+fi
 
 # The process id in $1 if that process is a korvsnmpcd that still runs.
 our_collector() {
