@@ -1,5 +1,8 @@
 // korvsnmp-agentx's snapshot: the library's result as KORVSNMP-MIB objects,
 // the row indexes kept between samples, and its command line.
+#include <cstdio>
+#include <string>
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -115,13 +118,28 @@ TEST(AgentxOptions, CommandLines)
          "--interval wants whole seconds from 1 to 86400, not \"99999999999999999999\""},
         {{"--persistent-dir", ""}, "--persistent-dir needs a non-empty value"},
         {{"--agentx-socket"}, "--agentx-socket needs a value"},
-        {{"--verbose"}, "unknown argument \"--verbose\""}};
+        {{"--verbose"}, "unknown argument \"--verbose\""},
+        {{"--version"}, ""},
+        {{"-V"}, ""}};
     for (const auto &[arguments, expected] : cases) {
         Options options;
         std::string error;
         EXPECT_EQ(ParseOptions(arguments, options, error), expected.empty());
         EXPECT_EQ(error, expected);
     }
+}
+
+// Like korvsnmp-stat and korvsnmpcd: the name, the version, status 0.
+TEST(AgentxProgram, VersionAnswersLikeTheOtherPrograms)
+{
+    FILE *program = popen(KORVSNMP_AGENTX_PATH " --version 2>&1", "r");
+    ASSERT_NE(program, nullptr);
+    char line[256] = {};
+    const bool read = std::fgets(line, sizeof line, program) != nullptr;
+    const int status = pclose(program);
+    EXPECT_TRUE(read);
+    EXPECT_EQ(std::string(line), std::string("korvsnmp-agentx ") + KORVSNMP_PROJECT_VERSION + "\n");
+    EXPECT_EQ(status, 0);
 }
 
 }  // namespace

@@ -14,6 +14,7 @@ struct Options {
     uint32_t pingSeconds = 5;  // AgentX ping: how soon a restarted master is found again
     std::string persistentDir = "/var/lib/korvsnmp-agentx";
     bool help = false;
+    bool version = false;  // -V, --version
 };
 
 // Parses the arguments after the program name. On false, `error` says what

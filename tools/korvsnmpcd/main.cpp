@@ -131,9 +131,10 @@ int main(int argc, char **argv)
             MakeAbsolute(*path);
     }
 
-    // A daemon's caller sees why it did not start; once detached, its stderr is /dev/null.
-    bool toStderr = options.foreground || options.detach || isatty(STDERR_FILENO);
-    openlog(kProgram, LOG_PID | (toStderr ? LOG_PERROR : 0), LOG_DAEMON);
+    // Until it is ready, its caller sees on stderr why it did not start, also
+    // with no syslog to read (no /dev/log); then stderr only when asked for.
+    const bool keepStderr = options.foreground || isatty(STDERR_FILENO);
+    openlog(kProgram, LOG_PID | LOG_PERROR, LOG_DAEMON);
     signal(SIGPIPE, SIG_IGN);
 
     // The daemon detaches first: the signal descriptor and the poller must
@@ -174,6 +175,10 @@ int main(int argc, char **argv)
         ready.Reset();
     }
     korvsnmpcd::NotifyReady();
+    if (!keepStderr) {
+        closelog();
+        openlog(kProgram, LOG_PID, LOG_DAEMON);
+    }
     if (!options.simulatePath.empty())
         KORVSNMP_LOG(LOG_INFO, "Listening on [%s], simulating [%s] every %lld ms",
                      options.server.socketPath.c_str(), options.simulatePath.c_str(),
