@@ -10,7 +10,7 @@ if [ "$(id -u)" -eq 0 ]; then as_root=; else as_root=sudo; fi
 $as_root apt-get update -qq
 $as_root env DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends \
     ca-certificates cmake make g++ binutils pkg-config libjsoncpp-dev libgtest-dev libgmock-dev \
-    libbenchmark-dev python3-prometheus-client mandoc dpkg-dev file lintian \
+    libbenchmark-dev python3-prometheus-client mandoc man-db dpkg-dev file lintian \
     snmpd snmp smitools libsmi2-common libsnmp-dev >/dev/null
 
 jobs=$(nproc 2>/dev/null || echo 2)

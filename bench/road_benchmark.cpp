@@ -358,7 +358,7 @@ extern "C" void __syslog_chk(int priority, int, const char *format, ...)
 namespace {
 
 using korvproto::kCollectorSocketPath;
-constexpr int kSpaces = 64;  // as many nodes as the large appliance has spaces
+const int kSpaces = korvexample::SpaceDeviceCount(korvexample::LargeAppliance());  // its spaces' and caches' devices
 
 // Real block-device nodes for the spaces: the library resolves each through
 // /sys/dev/block, as on the appliance.

@@ -113,10 +113,13 @@ void AddSpaces(const ApplianceShape &shape, const std::vector<SpaceDevice> &devi
     const size_t spaces = std::min(devices.size(), static_cast<size_t>(std::max(shape.spaces, 0)));
     for (size_t i = 0; i < spaces; ++i) {
         host.spaces.push_back({devices[i].path, "volume" + std::to_string(i + 1)});
-        if (static_cast<int>(i) < shape.flashCaches)
-            host.flashCaches.push_back({devices[i].path, "/volume" + std::to_string(i + 1),
-                                        devices[(i + 1) % spaces].path});
         spaceIO.append(Counters(Device(devices[i].kernelName), static_cast<unsigned int>(i + 7)));
+    }
+    const size_t caches = std::min({devices.size() - spaces, spaces, static_cast<size_t>(std::max(shape.flashCaches, 0))});
+    for (size_t i = 0; i < caches; ++i) {
+        const SpaceDevice &layer = devices[spaces + i];
+        host.flashCaches.push_back({devices[i].path, "/volume" + std::to_string(i + 1), layer.path});
+        spaceIO.append(Counters(Device(layer.kernelName), static_cast<unsigned int>(spaces + i + 7)));
     }
     spaceIO.append(Counters(Device("total"), 99));
 }
@@ -224,12 +227,20 @@ ApplianceShape SmallAppliance()
     return shape;
 }
 
-std::vector<SpaceDevice> ApplianceSpaceDevices(int count)
+int SpaceDeviceCount(const ApplianceShape &shape)
+{
+    return std::max(shape.spaces, 0) + std::clamp(shape.flashCaches, 0, std::max(shape.spaces, 0));
+}
+
+std::vector<SpaceDevice> ApplianceSpaceDevices(const ApplianceShape &shape)
 {
     std::vector<SpaceDevice> devices;
-    for (int i = 0; i < count; ++i)
+    for (int i = 0; i < shape.spaces; ++i)
         devices.push_back({"/dev/mapper/vg" + std::to_string(i + 1) + "-volume_" + std::to_string(i + 1),
                            "dm-" + std::to_string(i)});
+    for (int i = 0; i < SpaceDeviceCount(shape) - shape.spaces; ++i)
+        devices.push_back({"/dev/mapper/cachedev_" + std::to_string(i + 1),
+                           "dm-" + std::to_string(shape.spaces + i)});
     return devices;
 }
 

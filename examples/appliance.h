@@ -48,20 +48,27 @@ struct SpaceDevice {
     std::string kernelName;
 };
 
-// Devices named as on an appliance ("/dev/mapper/vg1-volume_1", "dm-0"),
-// for descriptions written to files. Where no such nodes exist, the library
-// leaves the spaces out of its result.
-std::vector<SpaceDevice> ApplianceSpaceDevices(int count);
+// How many block devices the spaces of `shape` need: one per space, and one
+// per flash cache for the layered device that it forms over its space.
+int SpaceDeviceCount(const ApplianceShape &shape);
+
+// The devices of `shape`'s spaces named as on an appliance: the spaces'
+// ("/dev/mapper/vg1-volume_1", "dm-0"...), then the flash caches'
+// ("/dev/mapper/cachedev_1", after the spaces' dm numbers), for descriptions
+// written to files. Where no such nodes exist, the library leaves the
+// spaces out of its result.
+std::vector<SpaceDevice> ApplianceSpaceDevices(const ApplianceShape &shape);
 
 struct Appliance {
     korvstandin::HostDescription host;
     Json::Value reply;  // the collector's reply: {"data": {...}}
 };
 
-// The appliance of `shape`; space i (and flash cache i's layered device,
-// which is space i+1's) use `spaceDevices`, which should hold at least
-// `shape.spaces` entries (spaces beyond it are left out). The result is the
-// same for the same arguments.
+// The appliance of `shape`. `spaceDevices` holds SpaceDeviceCount(shape)
+// devices: first the spaces', then the flash caches' layered devices; spaces
+// and flash caches beyond it are left out. The reply has a record for every
+// one of them, so that every space is named: a cached one through its cache's
+// device. The result is the same for the same arguments.
 Appliance MakeAppliance(const ApplianceShape &shape, const std::vector<SpaceDevice> &spaceDevices);
 
 }  // namespace korvexample

@@ -3,11 +3,14 @@
 //
 //   generate_appliance DIRECTORY
 //
-// gives DIRECTORY/large-appliance.host.json and
-// DIRECTORY/large-appliance.reply.json.
+// gives DIRECTORY/large-appliance.host.json, DIRECTORY/large-appliance.reply.json
+// and DIRECTORY/large-appliance.devices: the block devices that the spaces
+// and flash caches stand on, one a line, "KERNEL-NAME NODE-PATH" (what
+// run_stat.sh --simulate makes for them).
 #include <cstdio>
 #include <fstream>
 #include <string>
+#include <vector>
 
 #include <json/writer.h>
 
@@ -38,12 +41,16 @@ int main(int argc, char **argv)
     }
     const std::string directory = argv[1];
     const korvexample::ApplianceShape shape = korvexample::LargeAppliance();
-    const korvexample::Appliance appliance =
-        korvexample::MakeAppliance(shape, korvexample::ApplianceSpaceDevices(shape.spaces));
+    const std::vector<korvexample::SpaceDevice> devices = korvexample::ApplianceSpaceDevices(shape);
+    const korvexample::Appliance appliance = korvexample::MakeAppliance(shape, devices);
+    std::string deviceLines;
+    for (const korvexample::SpaceDevice &device : devices)
+        deviceLines += device.kernelName + " " + device.path + "\n";
     Json::StreamWriterBuilder builder;
     builder["indentation"] = "  ";
     const bool written =
         Write(directory + "/large-appliance.host.json", korvstandin::HostFileText(appliance.host)) &&
-        Write(directory + "/large-appliance.reply.json", Json::writeString(builder, appliance.reply) + "\n");
+        Write(directory + "/large-appliance.reply.json", Json::writeString(builder, appliance.reply) + "\n") &&
+        Write(directory + "/large-appliance.devices", deviceLines);
     return written ? 0 : 1;
 }

@@ -5,8 +5,10 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <cstdio>
 #include <filesystem>
 #include <fstream>
+#include <string>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -387,7 +389,9 @@ TEST(AgentxOptions, CommandLines)
          "--interval wants whole seconds from 1 to 86400, not \"99999999999999999999\""},
         {{"--state-dir", ""}, "--state-dir needs a non-empty value"},
         {{"--agentx-socket"}, "--agentx-socket needs a value"},
-        {{"--verbose"}, "unknown argument \"--verbose\""}};
+        {{"--verbose"}, "unknown argument \"--verbose\""},
+        {{"--version"}, ""},
+        {{"-V"}, ""}};
     for (const auto &[arguments, expected] : cases) {
         Options options;
         std::string error;
@@ -398,6 +402,19 @@ TEST(AgentxOptions, CommandLines)
     std::string error;
     ASSERT_TRUE(ParseOptions({"--persistent-dir", "/var/lib/y"}, options, error));
     EXPECT_EQ(options.stateDir, "/var/lib/y");
+}
+
+// Like korvsnmp-stat and korvsnmpcd: the name, the version, status 0.
+TEST(AgentxProgram, VersionAnswersLikeTheOtherPrograms)
+{
+    FILE *program = popen(KORVSNMP_AGENTX_PATH " --version 2>&1", "r");
+    ASSERT_NE(program, nullptr);
+    char line[256] = {};
+    const bool read = std::fgets(line, sizeof line, program) != nullptr;
+    const int status = pclose(program);
+    EXPECT_TRUE(read);
+    EXPECT_EQ(std::string(line), std::string("korvsnmp-agentx ") + KORVSNMP_PROJECT_VERSION + "\n");
+    EXPECT_EQ(status, 0);
 }
 
 }  // namespace

@@ -6,7 +6,7 @@ execute_process(COMMAND ${GENERATOR} ${OUT} RESULT_VARIABLE status)
 if(NOT status EQUAL 0)
   message(FATAL_ERROR "generate_appliance failed: ${status}")
 endif()
-foreach(name large-appliance.host.json large-appliance.reply.json)
+foreach(name large-appliance.host.json large-appliance.reply.json large-appliance.devices)
   execute_process(COMMAND ${CMAKE_COMMAND} -E compare_files ${OUT}/${name} ${EXPECTED}/${name}
                   RESULT_VARIABLE differ)
   if(NOT differ EQUAL 0)

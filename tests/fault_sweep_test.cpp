@@ -93,10 +93,10 @@ struct FaultSweep : korvtest::PlatformTest {
     void SetUp() override
     {
         PlatformTest::SetUp();
-        const size_t spaces = static_cast<size_t>(korvexample::SmallAppliance().spaces);
-        if (std::string whyNot; !nodes_.Make(spaces, whyNot)) GTEST_SKIP() << whyNot;
+        const size_t count = static_cast<size_t>(korvexample::SpaceDeviceCount(korvexample::SmallAppliance()));
+        if (std::string whyNot; !nodes_.Make(count, whyNot)) GTEST_SKIP() << whyNot;
         std::vector<korvexample::SpaceDevice> devices;
-        for (size_t i = 0; i < spaces; ++i) devices.push_back({nodes_.Node(i), nodes_.Name(i)});
+        for (size_t i = 0; i < count; ++i) devices.push_back({nodes_.Node(i), nodes_.Name(i)});
         appliance_ = korvexample::MakeAppliance(korvexample::SmallAppliance(), devices);
         Describe();
         korvstandin::SetJournal(true);

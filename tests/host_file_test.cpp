@@ -44,11 +44,11 @@ std::string FileText(const char *p) { std::ifstream in(p); return {std::istreamb
 TEST_F(HostFileTest, GoodFileAnswersAsTheDescriptionInMemory)
 {
     const korvexample::ApplianceShape shape = korvexample::SmallAppliance();
-    const size_t spaces = static_cast<size_t>(shape.spaces);
+    const size_t count = static_cast<size_t>(korvexample::SpaceDeviceCount(shape));
     korvtest::BlockNodes nodes;
-    if (std::string whyNot; !nodes.Make(spaces, whyNot)) GTEST_SKIP() << whyNot;
+    if (std::string whyNot; !nodes.Make(count, whyNot)) GTEST_SKIP() << whyNot;
     std::vector<korvexample::SpaceDevice> devices;
-    for (size_t i = 0; i < spaces; ++i) devices.push_back({nodes.Node(i), nodes.Name(i)});
+    for (size_t i = 0; i < count; ++i) devices.push_back({nodes.Node(i), nodes.Name(i)});
     const korvexample::Appliance appliance = korvexample::MakeAppliance(shape, devices);
     const Json::Value request(Json::objectValue); korvstandin::Host() = appliance.host;
     Json::Value inMemory, fromFile;

@@ -3,6 +3,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <sstream>
@@ -71,7 +72,9 @@ TEST(KorvsnmpStatOptions, BadCommandLinesSayWhatIsWrong)
         {{"--watch=nan"}, "--watch needs seconds from 0.1 to 86400, not \"nan\""},
         {{"--watch=1e9"}, "--watch needs seconds from 0.1 to 86400, not \"1e9\""},
         {{"--watch=2s"}, "--watch needs seconds from 0.1 to 86400, not \"2s\""},
-        {{"--watch=1", "--watch-count=-1"}, "--watch-count needs a number of draws, not \"-1\""}};
+        {{"--watch=1", "--watch-count=-1"}, "--watch-count needs a number of draws, not \"-1\""},
+        {{"--output="}, "--output needs a file name"},
+        {{"--reload", "--output", "f"}, "--reload and --output cannot be combined"}};
     for (const auto &[arguments, expected] : cases) {
         Options options; std::string error;
         EXPECT_FALSE(ParseOptions(arguments, options, error)) << expected;
@@ -315,6 +318,30 @@ TEST(KorvsnmpStatProgram, PrintsTheAssembledResultAsJsonTablesAndOpenMetrics)
     ASSERT_TRUE(collector.WaitForConnections(3));
     EXPECT_EQ(collector.Requests().at(0),
               korvtest::Frame(std::string("{\"resource\":[\"cpu\",\"nfs\"]}\n") + '\0'));
+}
+
+TEST(KorvsnmpStatProgram, ControlRequestsSayWhatHappened)
+{
+    korvtest::TestCollector collector;
+    for (int i = 0; i < 2; ++i) collector.Script({korvtest::Frame(R"({"success":true})")});
+    const Outcome reload = RunStat("--reload");
+    const Outcome history = RunStat("--history-mode 'backup window'");
+    EXPECT_EQ(std::make_pair(reload.status, reload.out), std::make_pair(0, std::string("The collector reloaded.\n")));
+    EXPECT_EQ(std::make_pair(history.status, history.out),
+              std::make_pair(0, std::string("The collector entered history mode: backup window\n")));
+}
+
+TEST(KorvsnmpStatProgram, OutputGoesToTheFileInsteadOfStandardOutput)
+{
+    korvtest::TestCollector collector;
+    collector.Script({korvtest::Frame(kCpuAndNfsReply)});
+    const std::string file = "/tmp/korvsnmp-stat-output-" + std::to_string(getpid()) + ".json";
+    const Outcome run = RunStat("--resource nfs --compact --output " + file);
+    std::ifstream in(file);
+    const std::string written{std::istreambuf_iterator<char>(in), {}};
+    std::remove(file.c_str());
+    EXPECT_EQ(std::make_pair(run.status, run.out), std::make_pair(0, std::string()));
+    EXPECT_EQ(written, R"({"nfs":{"read_byte":5},"time":1795000000})" "\n");
 }
 
 TEST(KorvsnmpStatProgram, NoCollectorIsAClearLineAndAFailingStatus)

@@ -54,9 +54,15 @@ TEST(KorvsnmpcdProgram, ExitStatusAndOutputOfTheCommandLine)
         {{"--verbose"}, kUsageError, Refused("unknown option [--verbose]")},
         {{"extra"}, kUsageError, Refused("unexpected argument [extra]")},
         {{"--daemon", "--foreground"}, kUsageError, Refused("--daemon and --foreground exclude each other")},
+        {{"--replay", "r.json", "--simulate", "s.json"}, kUsageError, Refused("--replay and --simulate exclude each other")},
+        {{"--foreground", "--simulate", "/nonexistent/s.json"}, 1,
+         HasSubstr("Cannot read the appliance [/nonexistent/s.json]")},
         {{"--version"}, 0, Eq(std::string("korvsnmpcd ") + KORVSNMP_PROJECT_VERSION + "\n")},
-        // Without a terminal or --foreground, messages go to syslog only.
-        {{"--replay", "/nonexistent/reply.json"}, 1, Eq("")},
+        // What stops it from starting goes to stderr, with or without --foreground or --daemon.
+        {{"--replay", "/nonexistent/reply.json"}, 1,
+         HasSubstr("Cannot read the reply to replay from [/nonexistent/reply.json]")},
+        {{"--daemon", "--replay", "/nonexistent/reply.json"}, 1,
+         HasSubstr("Cannot read the reply to replay from [/nonexistent/reply.json]")},
         {{"--foreground", "--replay", "/nonexistent/r.json"}, 1,
          HasSubstr("Cannot read the reply to replay from [/nonexistent/r.json]")},
         {{"--probe", "--socket", "/nonexistent/k.sock"}, 1, Eq("")}};  // nothing listens there

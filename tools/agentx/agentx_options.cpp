@@ -27,6 +27,7 @@ bool ParseSeconds(const std::string &text, uint32_t &seconds)
 const char kUsage[] =
     "Usage: korvsnmp-agentx [--agentx-socket PATH] [--interval SECONDS]\n"
     "                       [--ping-interval SECONDS] [--state-dir DIR]\n"
+    "       korvsnmp-agentx --help | --version\n"
     "\n"
     "An AgentX subagent that serves KORVSNMP-MIB from libkorvsnmp's statistics.\n"
     "  --agentx-socket PATH     the master agent's AgentX socket (/var/agentx/master)\n"
@@ -44,6 +45,10 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
         const std::string &argument = arguments[i];
         if (argument == "-h" || argument == "--help") {
             options.help = true;
+            continue;
+        }
+        if (argument == "-V" || argument == "--version") {
+            options.version = true;
             continue;
         }
         const bool takesValue = argument == "--agentx-socket" || argument == "--interval" ||

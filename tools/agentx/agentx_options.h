@@ -15,6 +15,7 @@ struct Options {
     // The state directory: the row indexes (kIndexFileName) and net-snmp's files.
     std::string stateDir = "/var/lib/korvsnmp-agentx";
     bool help = false;
+    bool version = false;  // -V, --version
 };
 
 // Parses the arguments after the program name. On false, `error` says what

@@ -103,6 +103,10 @@ int main(int argc, char **argv)
         std::fputs(korvagentx::kUsage, stdout);
         return 0;
     }
+    if (options.version) {
+        std::printf("%s %s\n", kAppName, KORVSNMP_VERSION);
+        return 0;
+    }
 
     openlog(kAppName, LOG_PID | LOG_PERROR, LOG_DAEMON);
     snmp_disable_log();

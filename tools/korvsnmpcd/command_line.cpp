@@ -97,6 +97,8 @@ bool ParseOptions(int argc, const char *const *argv, Options &options, std::stri
             ok = path(options.pidFile);
         } else if (name == "--replay") {
             ok = path(options.replayPath);
+        } else if (name == "--simulate") {
+            ok = path(options.simulatePath);
         } else if (name == "--record") {
             ok = path(options.server.recordPath);
         } else if (name == "--proc-root") {
@@ -134,6 +136,10 @@ bool ParseOptions(int argc, const char *const *argv, Options &options, std::stri
         if (!ok)
             return false;
     }
+    if (!options.replayPath.empty() && !options.simulatePath.empty()) {
+        error = "--replay and --simulate exclude each other";
+        return false;
+    }
     if (options.detach && options.foreground) {
         error = "--daemon and --foreground exclude each other";
         return false;
@@ -151,6 +157,8 @@ void PrintUsage(FILE *to)
                  "  --client-timeout SECONDS  time a client has for its exchange (default 2)\n"
                  "  --max-connections N       connections served at once (default %zu)\n"
                  "  --replay FILE             answer with the reply in FILE instead of sampling\n"
+                 "  --simulate FILE           answer with an appliance whose average load is the\n"
+                 "                            reply in FILE, moving from sample to sample\n"
                  "  --record FILE             write the next statistics reply to FILE\n"
                  "  --proc-root DIR           read the kernel's statistics from DIR, not /proc\n"
                  "  --sys-root DIR            read the block devices and the iSCSI target from\n"

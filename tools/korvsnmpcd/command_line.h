@@ -21,6 +21,7 @@ struct Options {
     std::string replayPath;   // serve this file's reply instead of sampling
     std::string procRoot = kProcRoot;  // what stands for /proc, for /sys
     std::string sysRoot = kSysRoot;
+    std::string simulatePath; // simulate the appliance whose average reply is in this file
 };
 
 // Reads argv[1..argc-1] into `options`: "--name value" or "--name=value".

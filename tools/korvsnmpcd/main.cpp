@@ -19,6 +19,7 @@
 #include "reply_file.h"
 #include "sampler.h"
 #include "server.h"
+#include "simulation.h"
 #include "service_notify.h"
 #include "protocol/unique_fd.h"
 
@@ -126,13 +127,14 @@ int main(int argc, char **argv)
         CloseInheritedDescriptors();
         for (std::string *path : {&options.server.socketPath, &options.server.recordPath,
                                   &options.pidFile, &options.replayPath, &options.procRoot,
-                                  &options.sysRoot})
+                                  &options.sysRoot, &options.simulatePath})
             MakeAbsolute(*path);
     }
 
-    // A daemon's caller sees why it did not start; once detached, its stderr is /dev/null.
-    bool toStderr = options.foreground || options.detach || isatty(STDERR_FILENO);
-    openlog(kProgram, LOG_PID | (toStderr ? LOG_PERROR : 0), LOG_DAEMON);
+    // Until it is ready, its caller sees on stderr why it did not start, also
+    // with no syslog to read (no /dev/log); then stderr only when asked for.
+    const bool keepStderr = options.foreground || isatty(STDERR_FILENO);
+    openlog(kProgram, LOG_PID | LOG_PERROR, LOG_DAEMON);
     signal(SIGPIPE, SIG_IGN);
 
     // The daemon detaches first: the signal descriptor and the poller must
@@ -151,6 +153,11 @@ int main(int argc, char **argv)
         if (!replay->Load())
             return EXIT_FAILURE;
         source = std::move(replay);
+    } else if (!options.simulatePath.empty()) {
+        auto simulation = std::make_unique<korvsnmpcd::Simulation>(options.simulatePath);
+        if (!simulation->Load())
+            return EXIT_FAILURE;
+        source = std::move(simulation);
     }
     korvsnmpcd::Server server(options.server);
     if (!server.Listen())
@@ -169,7 +176,15 @@ int main(int argc, char **argv)
         ready.Reset();
     }
     korvsnmpcd::NotifyReady();
-    if (options.replayPath.empty())
+    if (!keepStderr) {
+        closelog();
+        openlog(kProgram, LOG_PID, LOG_DAEMON);
+    }
+    if (!options.simulatePath.empty())
+        KORVSNMP_LOG(LOG_INFO, "Listening on [%s], simulating [%s] every %lld ms",
+                     options.server.socketPath.c_str(), options.simulatePath.c_str(),
+                     static_cast<long long>(options.server.interval.count()));
+    else if (options.replayPath.empty())
         KORVSNMP_LOG(LOG_INFO, "Listening on [%s], sampling every %lld ms",
                        options.server.socketPath.c_str(),
                        static_cast<long long>(options.server.interval.count()));

@@ -5,6 +5,7 @@
 
 #include <chrono>
 #include <iostream>
+#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
@@ -12,6 +13,7 @@
 #include "korvsnmp/korvsnmp.h"
 #include "openmetrics_format.h"
 #include "options.h"
+#include "output_file.h"
 #include "protocol/collector_protocol.h"
 #include "table_format.h"
 #include "watch.h"
@@ -48,20 +50,20 @@ Json::Value BuildRequest(const std::vector<std::string> &resources)
     return request;
 }
 
-void Print(const Json::Value &result, const korvstat::Options &options)
+void Print(const Json::Value &result, const korvstat::Options &options, std::ostream &out)
 {
     switch (options.format) {
     case korvstat::Format::Table:
-        korvstat::WriteTables(result, options.rawNumbers, std::cout);
+        korvstat::WriteTables(result, options.rawNumbers, out);
         break;
     case korvstat::Format::OpenMetrics:
-        korvstat::WriteOpenMetrics(result, std::cout);
+        korvstat::WriteOpenMetrics(result, out);
         break;
     case korvstat::Format::CompactJson:
-        std::cout << korvproto::CompactJson(result) << '\n';
+        out << korvproto::CompactJson(result) << '\n';
         break;
     case korvstat::Format::PrettyJson:
-        std::cout << result.toStyledString();
+        out << result.toStyledString();
         break;
     }
 }
@@ -79,7 +81,15 @@ int Statistics(const korvstat::Options &options)
     Json::Value result(Json::objectValue);
     if (!SNMPParseReplyData(request, std::move(reply), result))
         return Fail("the collector's reply could not be assembled into statistics");
-    Print(result, options);
+    if (options.output.empty()) {
+        Print(result, options, std::cout);
+        return 0;
+    }
+    std::ostringstream text;
+    Print(result, options, text);
+    std::string error;
+    if (!korvstat::ReplaceFile(options.output, text.str(), error))
+        return Fail(error);
     return 0;
 }
 
@@ -91,7 +101,7 @@ int WatchStatistics(const korvstat::Options &options)
     return korvstat::Watch(
         interval, options.watchCount,
         [&] {
-            if (terminal)
+            if (terminal && options.output.empty())
                 std::cout << kClearScreen;
             const int status = Statistics(options);
             std::cout << std::flush;
@@ -121,11 +131,15 @@ int main(int argc, char **argv)
         std::cout << "korvsnmp-stat " KORVSNMP_VERSION "\n";
         return 0;
     case korvstat::Action::Reload:
-        return Transmitor::Reload() ? 0 : Fail(ControlFailure("the collector did not reload"));
+        if (!Transmitor::Reload())
+            return Fail(ControlFailure("the collector did not reload"));
+        std::cout << "The collector reloaded.\n";
+        return 0;
     case korvstat::Action::HistoryMode:
-        return Transmitor::EnterHistoryMode(options.reason)
-                   ? 0
-                   : Fail(ControlFailure("the collector did not enter history mode"));
+        if (!Transmitor::EnterHistoryMode(options.reason))
+            return Fail(ControlFailure("the collector did not enter history mode"));
+        std::cout << "The collector entered history mode: " << options.reason << "\n";
+        return 0;
     case korvstat::Action::Statistics:
         break;
     }
