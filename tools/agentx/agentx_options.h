@@ -1,4 +1,5 @@
-// korvsnmp-agentx's command line.
+// The options of both front ends: korvsnmp-agentx's command line, and the
+// snmpd.conf tokens of snmpd's module.
 #ifndef KORVAGENTX_AGENTX_OPTIONS_H
 #define KORVAGENTX_AGENTX_OPTIONS_H
 
@@ -21,6 +22,16 @@ struct Options {
 bool ParseOptions(const std::vector<std::string> &arguments, Options &options, std::string &error);
 
 extern const char kUsage[];
+
+// The module's snmpd.conf token for --interval, and its help text.
+inline constexpr char kIntervalToken[] = "korvsnmpInterval";
+inline constexpr char kIntervalTokenHelp[] = "SECONDS (1-86400, default 5)";
+
+// Parses the value of `name` (an option or token), whole seconds from 1 to
+// 86400, into `seconds`. On false, `error` says what is wrong and `seconds`
+// is unchanged.
+bool ParseSeconds(const std::string &name, const std::string &text, uint32_t &seconds,
+                  std::string &error);
 
 }  // namespace korvagentx
 

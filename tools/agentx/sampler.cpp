@@ -31,6 +31,18 @@ constexpr auto kInterruptRepeat = std::chrono::milliseconds(50);
 
 void IgnoreInterrupt(int) {}
 
+// The sampling thread takes none of the process's asynchronous signals (they
+// belong to the program that it runs in) but the interrupt; faults stay
+// deliverable.
+void KeepOnlyTheInterrupt()
+{
+    sigset_t blocked;
+    sigfillset(&blocked);
+    for (int signal : {kInterruptSignal, SIGSEGV, SIGBUS, SIGFPE, SIGILL, SIGTRAP, SIGABRT})
+        sigdelset(&blocked, signal);
+    pthread_sigmask(SIG_SETMASK, &blocked, nullptr);
+}
+
 // Each resource, the reply section that it needs and the result member
 // that it fills.
 struct Section {
@@ -122,8 +134,8 @@ NetworkKinds AskNetworkKinds(const Json::Value &result)
 Sampler::Sampler(uint32_t intervalSeconds) : intervalSeconds_(intervalSeconds)
 {
     TableIndexes none;
-    current_ = std::make_shared<const Snapshot>(BuildSnapshot(
-        Json::Value(), NetworkKinds{}, none, intervalSeconds_, std::chrono::steady_clock::now()));
+    std::atomic_store(&current_, std::make_shared<const EncodedSnapshot>(BuildSnapshot(
+        Json::Value(), NetworkKinds{}, none, intervalSeconds_, std::chrono::steady_clock::now())));
 }
 
 Sampler::~Sampler()
@@ -141,12 +153,15 @@ void Sampler::Start()
     }
     struct sigaction interrupt {};
     interrupt.sa_handler = IgnoreInterrupt;  // no SA_RESTART: waits end with EINTR
-    sigaction(kInterruptSignal, &interrupt, nullptr);
+    sigaction(kInterruptSignal, &interrupt, &previousInterrupt_);
     stopping_ = false;
     running_ = true;
     thread_ = std::thread([this] {
+        KeepOnlyTheInterrupt();
         Run();
+        std::lock_guard<std::mutex> lock(endMutex_);
         running_ = false;
+        ended_.notify_all();
     });
 }
 
@@ -159,11 +174,14 @@ void Sampler::Stop()
     }
     if (thread_.joinable()) {
         // The thread may be about to wait on the collector: repeat until it ends.
+        std::unique_lock<std::mutex> lock(endMutex_);
         while (running_) {
             pthread_kill(thread_.native_handle(), kInterruptSignal);
-            std::this_thread::sleep_for(kInterruptRepeat);
+            ended_.wait_for(lock, kInterruptRepeat, [this] { return !running_; });
         }
+        lock.unlock();
         thread_.join();
+        sigaction(kInterruptSignal, &previousInterrupt_, nullptr);
     }
     for (int &fd : wakeFds_) {
         if (fd >= 0)
@@ -178,12 +196,6 @@ void Sampler::SampleNow()
         ssize_t ignored = write(wakeFds_[1], &kWakeSample, 1);
         (void)ignored;
     }
-}
-
-std::shared_ptr<const Snapshot> Sampler::Current() const
-{
-    std::lock_guard<std::mutex> lock(mutex_);
-    return current_;
 }
 
 void Sampler::Run()
@@ -223,11 +235,10 @@ void Sampler::Sample()
     if (collectorAway_)
         syslog(LOG_NOTICE, "%s:%d The collector answers again", kUnit, __LINE__);
     collectorAway_ = false;
-    auto snapshot = std::make_shared<const Snapshot>(
+    auto snapshot = std::make_shared<const EncodedSnapshot>(
         BuildSnapshot(outcome.result, AskNetworkKinds(outcome.result), indexes_, intervalSeconds_,
                       std::chrono::steady_clock::now()));
-    std::lock_guard<std::mutex> lock(mutex_);
-    current_ = std::move(snapshot);
+    std::atomic_store(&current_, std::shared_ptr<const EncodedSnapshot>(std::move(snapshot)));
 }
 
 }  // namespace korvagentx

@@ -1,7 +1,9 @@
 // The sampling thread: every interval (or at once on SampleNow) it runs the
 // library's whole road, Transmit, GetDataJson and SNMPParseReplyData, builds
-// a snapshot and publishes it. Readers take the latest snapshot without ever
-// waiting on the library, the collector or the platform.
+// a snapshot, lays it out for answering and publishes it by swapping one
+// pointer. Readers take the latest snapshot without ever waiting on the
+// library, the collector or the platform; the thread takes none of the
+// process's signals but its own interrupt.
 #ifndef KORVAGENTX_SAMPLER_H
 #define KORVAGENTX_SAMPLER_H
 
@@ -9,11 +11,15 @@
 #include <chrono>
 #include <cstdint>
 #include <memory>
+#include <condition_variable>
 #include <mutex>
 #include <thread>
 
+#include <signal.h>
+
 #include <json/value.h>
 
+#include "encoded_snapshot.h"
 #include "snapshot.h"
 
 namespace korvagentx {
@@ -38,32 +44,41 @@ class Sampler {
 public:
     explicit Sampler(uint32_t intervalSeconds);
     ~Sampler();  // stops the thread
+    // The interval of the samples after the next Start (while stopped).
+    void SetInterval(uint32_t intervalSeconds) { intervalSeconds_ = intervalSeconds; }
     Sampler(const Sampler &) = delete;
     Sampler &operator=(const Sampler &) = delete;
 
+    // Starts the thread, which samples at once. A Sampler can be started
+    // again after Stop: the last snapshot, the failure count and the row
+    // indexes carry over.
     void Start();
     // Ends the thread, breaking off an exchange with the collector under way
-    // (SIGUSR2 to the thread). Call it from one thread only.
+    // (SIGUSR2 to the thread, whose previous handling is restored after).
+    // Call it from one thread only.
     void Stop();
     // Takes a sample now. Async-signal-safe.
     void SampleNow();
 
-    std::shared_ptr<const Snapshot> Current() const;
+    // The latest snapshot; never waits on a sample.
+    std::shared_ptr<const EncodedSnapshot> Current() const { return std::atomic_load(&current_); }
     uint32_t FailedSamples() const { return failed_.load(); }
 
 private:
     void Run();
     void Sample();
 
-    const uint32_t intervalSeconds_;
+    uint32_t intervalSeconds_;
     int wakeFds_[2] = {-1, -1};
     std::atomic<bool> stopping_{false};
     std::atomic<bool> running_{false};
     std::atomic<uint32_t> failed_{0};
     bool collectorAway_ = false;
     TableIndexes indexes_;
-    mutable std::mutex mutex_;
-    std::shared_ptr<const Snapshot> current_;
+    std::mutex endMutex_;
+    std::condition_variable ended_;
+    struct sigaction previousInterrupt_ {};
+    std::shared_ptr<const EncodedSnapshot> current_;  // std::atomic_load and std::atomic_store only
     std::thread thread_;
 };
 
