@@ -56,13 +56,36 @@ EncodedSnapshot::EncodedSnapshot(const Snapshot &snapshot) : taken_(snapshot.tak
         object.kind = entry.value.type;
         objects_.push_back(object);
     }
+    if (!objects_.empty()) {
+        prefixLength_ = objects_.front().nameLength;
+        for (const EncodedObject &object : objects_) {
+            const oid *name = Name(object);
+            const oid *first = Name(objects_.front());
+            size_t same = 0;
+            while (same < std::min<size_t>(prefixLength_, object.nameLength) && name[same] == first[same])
+                ++same;
+            prefixLength_ = same;
+        }
+    }
+}
+
+int EncodedSnapshot::AgainstPrefix(const oid *name, size_t length) const
+{
+    const oid *prefix = names_.data();
+    for (size_t i = 0; i < prefixLength_; ++i) {
+        if (i == length)
+            return -1;
+        if (name[i] != prefix[i])
+            return name[i] < prefix[i] ? -1 : 1;
+    }
+    return 0;
 }
 
 int EncodedSnapshot::Compare(const EncodedObject &object, const oid *name, size_t length) const
 {
     const oid *own = Name(object);
     const size_t common = std::min<size_t>(object.nameLength, length);
-    for (size_t i = 0; i < common; ++i)
+    for (size_t i = prefixLength_; i < common; ++i)
         if (own[i] != name[i])
             return own[i] < name[i] ? -1 : 1;
     return object.nameLength < length ? -1 : object.nameLength > length ? 1 : 0;
@@ -70,6 +93,8 @@ int EncodedSnapshot::Compare(const EncodedObject &object, const oid *name, size_
 
 const EncodedObject *EncodedSnapshot::Find(const oid *name, size_t length) const
 {
+    if (objects_.empty() || AgainstPrefix(name, length) != 0)
+        return nullptr;
     auto found = std::lower_bound(objects_.begin(), objects_.end(), 0,
                                   [&](const EncodedObject &object, int) {
                                       return Compare(object, name, length) < 0;
@@ -79,6 +104,10 @@ const EncodedObject *EncodedSnapshot::Find(const oid *name, size_t length) const
 
 const EncodedObject *EncodedSnapshot::FindNext(const oid *name, size_t length) const
 {
+    if (objects_.empty())
+        return nullptr;
+    if (const int side = AgainstPrefix(name, length); side != 0)
+        return side < 0 ? &objects_.front() : nullptr;
     auto found = std::upper_bound(objects_.begin(), objects_.end(), 0,
                                   [&](int, const EncodedObject &object) {
                                       return Compare(object, name, length) > 0;

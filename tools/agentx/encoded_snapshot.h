@@ -46,10 +46,15 @@ public:
 
 private:
     // Negative, zero or positive as `object`'s name sorts before, equal to
-    // or after `name`.
+    // or after `name`, both known to begin with the common prefix.
     int Compare(const EncodedObject &object, const oid *name, size_t length) const;
+    // Where `name` falls against the prefix that every name shares:
+    // negative before all names, positive after all, zero when it begins
+    // with the prefix.
+    int AgainstPrefix(const oid *name, size_t length) const;
 
     std::vector<oid> names_;
+    size_t prefixLength_ = 0;  // sub-identifiers that every name begins with
     std::string texts_;
     std::vector<EncodedObject> objects_;
     std::chrono::steady_clock::time_point taken_;
