@@ -137,8 +137,9 @@ def measure_together(instances, seconds):
 
 
 def profile(instance, seconds, scratch):
-    """perf record of the instance's processes during walks; the report's top lines."""
-    data = os.path.join(scratch, "perf.data")
+    """perf record of the instance's processes during walks: the share of each
+    process and library, then of each function above 0.7 %."""
+    data = os.path.join(scratch, "perf-%s.data" % instance.name)
     pids = ",".join(str(p.pid) for p in instance.processes)
     perf = subprocess.Popen(["perf", "record", "-q", "-o", data, "-p", pids],
                             stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
@@ -146,14 +147,14 @@ def profile(instance, seconds, scratch):
     instance.measure(seconds)
     perf.send_signal(signal.SIGINT)
     perf.wait()
-    report = subprocess.run(["perf", "report", "-i", data, "--stdio", "--no-children",
-                             "--sort", "comm,dso", "--percent-limit", "2"],
-                            capture_output=True, text=True).stdout
-    symbols = subprocess.run(["perf", "report", "-i", data, "--stdio", "--no-children",
-                              "--sort", "comm,dso,symbol", "--percent-limit", "1"],
-                             capture_output=True, text=True).stdout
-    keep = lambda text: "\n".join(l for l in text.splitlines() if l.strip() and not l.startswith("#"))
-    return keep(report) + "\n\n" + keep(symbols)
+    lines = []
+    for sort, limit in (("comm,dso", "1"), ("comm,dso,symbol", "0.7")):
+        report = subprocess.run(["perf", "report", "-i", data, "--stdio", "--no-children",
+                                 "--sort", sort, "--percent-limit", limit],
+                                capture_output=True, text=True).stdout
+        lines += [l.rstrip(" -") for l in report.splitlines() if l.strip() and not l.startswith("#")]
+        lines.append("")
+    return "\n".join(lines)
 
 
 def main():
@@ -219,8 +220,9 @@ def main():
                 print("  %-20s %.2f%s   [%s]" % (name, statistics.median(values), target,
                                                  " ".join("%.2f" % v for v in values)))
             if options.perf:
-                print("\nwhere the subagent's walks go (snmpd and korvsnmp-agentx, perf record):")
-                print(profile(subagent, 2 * options.seconds, scratch))
+                for instance in (subagent, instances[3]):
+                    print("\nwhere the %s's walks go (perf record of snmpd and the subagent):" % instance.name)
+                    print(profile(instance, 2 * options.seconds, scratch))
         finally:
             for process in reversed(STARTED):
                 if process.poll() is None:

@@ -10,6 +10,7 @@
 
 #include <algorithm>
 #include <iterator>
+#include <new>
 
 #include "mib_layout.h"
 
@@ -72,11 +73,8 @@ void SetValue(netsnmp_variable_list *variable, const EncodedObject &object,
     }
 }
 
-int HandleRequests(netsnmp_mib_handler *, netsnmp_handler_registration *,
-                   netsnmp_agent_request_info *info, netsnmp_request_info *requests)
+void Answer(netsnmp_agent_request_info *info, netsnmp_request_info *requests)
 {
-    if (theSampler == nullptr)
-        return SNMP_ERR_GENERR;
     const std::shared_ptr<const EncodedSnapshot> snapshot = theSampler->Current();
     for (netsnmp_request_info *request = requests; request != nullptr; request = request->next) {
         if (request->processed)
@@ -102,6 +100,20 @@ int HandleRequests(netsnmp_mib_handler *, netsnmp_handler_registration *,
             netsnmp_set_request_error(info, request, SNMP_ERR_NOTWRITABLE);
             break;
         }
+    }
+}
+
+int HandleRequests(netsnmp_mib_handler *, netsnmp_handler_registration *,
+                   netsnmp_agent_request_info *info, netsnmp_request_info *requests)
+{
+    if (theSampler == nullptr)
+        return SNMP_ERR_GENERR;
+    // No exception may cross net-snmp's C frames (in snmpd that would end snmpd).
+    try {
+        Answer(info, requests);
+    } catch (const std::bad_alloc &) {
+        syslog(LOG_ERR, "%s:%d Out of memory while answering", kUnit, __LINE__);
+        return SNMP_ERR_GENERR;
     }
     return SNMP_ERR_NOERROR;
 }

@@ -205,7 +205,13 @@ void Sampler::Run()
     while (!stopping_) {
         const auto now = std::chrono::steady_clock::now();
         if (now >= due) {
-            Sample();
+            // Nothing may leave the thread: in snmpd that would end snmpd.
+            try {
+                Sample();
+            } catch (const std::exception &error) {
+                ++failed_;
+                syslog(LOG_ERR, "%s:%d A sample failed: %s", kUnit, __LINE__, error.what());
+            }
             due = std::chrono::steady_clock::now() + std::chrono::milliseconds(intervalMs);
             continue;
         }
