@@ -18,7 +18,6 @@
 #include <map>
 #include <memory>
 #include <optional>
-#include <regex>
 #include <sstream>
 #include <thread>
 
@@ -78,6 +77,13 @@ std::ptrdiff_t Occurrences(const std::string &text, const std::string &part)
     std::ptrdiff_t count = 0;
     for (size_t at = 0; (at = text.find(part, at)) != std::string::npos; at += part.size()) ++count;
     return count;
+}
+
+// A walk without its korvSnapshotAge line: a second may pass between two walks.
+std::string WithoutAge(std::string walk)
+{
+    const size_t at = walk.find("korvSnapshotAge.0 = ");
+    return at == std::string::npos ? walk : walk.erase(at, walk.find('\n', at) + 1 - at);
 }
 
 // The appliance that the stand-in platform describes (KORVPLATFORM_HOST):
@@ -316,9 +322,7 @@ TEST_P(UnderSnmpd, EveryObjectIsTheLibrarysResultAndARestartedSnmpdServesAgain)
     const std::string walk = Client("snmpwalk", "korvsnmpMIB");
     EXPECT_THAT(Objects(walk), ::testing::ContainerEq(ExpectedObjects(LibraryResult(reply)))) << walk;
     EXPECT_THAT(walk, ::testing::EndsWith(kEndOfView));
-    const std::regex age("korvSnapshotAge.0 = Gauge32: [0-9]+");  // a second may pass between the walks
-    EXPECT_EQ(std::regex_replace(Client("snmpbulkwalk", "-Cr7 korvsnmpMIB"), age, "age"),
-              std::regex_replace(walk, age, "age"));
+    EXPECT_EQ(WithoutAge(Client("snmpbulkwalk", "-Cr7 korvsnmpMIB")), WithoutAge(walk));
 
     const std::tuple<const char *, const char *, std::string> edges[] = {
         {"snmpget", "korvDiskDevice.999", "korvDiskDevice.999 = No Such Instance currently exists at this OID\n"},
