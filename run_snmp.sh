@@ -4,8 +4,15 @@
 # (unless a collector already answers on /tmp/korvsnmpcd.sock), starts Debian's
 # snmpd on udp:127.0.0.1:1161 with a private configuration, starts the AgentX
 # subagent korvsnmp-agentx under it, and walks KORVSNMP-MIB with names.
+# With --module, snmpd loads korvsnmp-snmpd.so (dlmod) in place of the subagent.
 # Everything is left running; the last lines say how to stop it by process id.
 set -eu
+module=
+case "${1-}" in
+    --module) module=yes ;;
+    "") ;;
+    *) echo "usage: run_snmp.sh [--module]" >&2; exit 2 ;;
+esac
 cd "$(dirname "$0")"
 top=$(pwd)
 port=1161
@@ -25,7 +32,8 @@ if [ -n "$missing" ]; then
 fi
 
 cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
-cmake --build build -j "$(nproc 2>/dev/null || echo 2)" --target korvsnmp-stat korvsnmpcd korvsnmp-agentx >/dev/null
+cmake --build build -j "$(nproc 2>/dev/null || echo 2)" --target korvsnmp-stat korvsnmpcd korvsnmp-agentx \
+    korvsnmp-snmpd >/dev/null
 
 dir=$(mktemp -d /tmp/korvsnmp-snmp.XXXXXX)
 pids=
@@ -58,25 +66,35 @@ fi
 echo "==> starting snmpd on udp:127.0.0.1:$port (configuration in $dir)"
 cat >"$dir/snmpd.conf" <<CONF
 agentaddress udp:127.0.0.1:$port
-master agentx
-agentXSocket $dir/agentx.sock
 view korvview included .1.3.6.1.3.7947
 rocommunity public 127.0.0.1 -V korvview
 CONF
+if [ -n "$module" ]; then
+    printf 'dlmod korvsnmp %s\nkorvsnmpStateDir %s\n' "$top/build/tools/agentx/korvsnmp-snmpd.so" \
+        "$dir/module-state" >>"$dir/snmpd.conf"
+    served=korvsnmp-snmpd.so
+    subagent=
+else
+    printf 'master agentx\nagentXSocket %s\n' "$dir/agentx.sock" >>"$dir/snmpd.conf"
+    served=korvsnmp-agentx
+    subagent=", korvsnmp-agentx"
+fi
 SNMP_PERSISTENT_DIR="$dir/snmpd-state" setsid /usr/sbin/snmpd -f -C -c "$dir/snmpd.conf" -M '' -m '' \
     -Lf "$dir/snmpd.log" &
 pids="$pids $!"
-waitfor snmpd test -S "$dir/agentx.sock"
 
-echo "==> starting korvsnmp-agentx"
-setsid build/tools/agentx/korvsnmp-agentx --agentx-socket "$dir/agentx.sock" \
-    --state-dir "$dir/agentx-state" >"$dir/korvsnmp-agentx.log" 2>&1 &
-pids="$pids $!"
+if [ -z "$module" ]; then
+    waitfor snmpd test -S "$dir/agentx.sock"
+    echo "==> starting korvsnmp-agentx"
+    setsid build/tools/agentx/korvsnmp-agentx --agentx-socket "$dir/agentx.sock" \
+        --state-dir "$dir/agentx-state" >"$dir/korvsnmp-agentx.log" 2>&1 &
+    pids="$pids $!"
+fi
 
 mibs="/usr/share/snmp/mibs/ietf:/usr/share/mibs/ietf:$top/mibs/base:$top/mibs"
 client="-v2c -c public -M $mibs -m KORVSNMP-MIB 127.0.0.1:$port"
 # shellcheck disable=SC2086
-waitfor korvsnmp-agentx sh -c "snmpget -Oqv $client korvSampleTime.0 | grep -q '^[0-9]'"
+waitfor $served sh -c "snmpget -Oqv $client korvSampleTime.0 | grep -q '^[0-9]'"
 
 echo "==> snmpwalk $client korvsnmpMIB"
 # shellcheck disable=SC2086
@@ -84,5 +102,5 @@ snmpwalk $client korvsnmpMIB
 echo
 echo "Walk again with:"
 echo "  snmpwalk $client korvsnmpMIB"
-echo "Stop what this script started (${names}snmpd, korvsnmp-agentx) with:"
+echo "Stop what this script started (${names}snmpd$subagent) with:"
 echo "  kill$pids; rm -rf $dir"
