@@ -4,6 +4,7 @@
 # (unless a collector already answers on /tmp/korvsnmpcd.sock), starts Debian's
 # snmpd on udp:127.0.0.1:1161 with a private configuration, starts the AgentX
 # subagent korvsnmp-agentx under it, and walks KORVSNMP-MIB with names.
+# With --module, snmpd loads korvsnmp-snmpd.so (dlmod) in place of the subagent.
 # Everything is left running; the last lines say how to stop it by process id.
 # A program that ends at once (snmpd on a busy port) is reported with its own
 # reason, and what was started is stopped again.
@@ -11,6 +12,12 @@
 # The environment may set KORVSNMP_BUILD (a built tree to use as it is,
 # instead of building build/) and KORVSNMP_SNMP_PORT (instead of 1161).
 set -eu
+module=
+case "${1-}" in
+    --module) module=yes ;;
+    "") ;;
+    *) echo "usage: run_snmp.sh [--module]" >&2; exit 2 ;;
+esac
 cd "$(dirname "$0")"
 top=$(pwd)
 port=${KORVSNMP_SNMP_PORT:-1161}
@@ -33,7 +40,7 @@ fi
 if [ -z "${KORVSNMP_BUILD:-}" ]; then
     cmake -S . -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
     cmake --build "$build" -j "$(nproc 2>/dev/null || echo 2)" --target korvsnmp-stat korvsnmpcd \
-        korvsnmp-agentx >/dev/null
+        korvsnmp-agentx korvsnmp-snmpd >/dev/null
 fi
 
 dir=$(mktemp -d /tmp/korvsnmp-snmp.XXXXXX)
@@ -96,27 +103,38 @@ fi
 echo "==> starting snmpd on udp:127.0.0.1:$port (configuration in $dir)"
 cat >"$dir/snmpd.conf" <<CONF
 agentaddress udp:127.0.0.1:$port
-master agentx
-agentXSocket $dir/agentx.sock
 view korvview included .1.3.6.1.3.7947
 rocommunity public 127.0.0.1 -V korvview
 CONF
+if [ -n "$module" ]; then
+    printf 'dlmod korvsnmp %s\nkorvsnmpStateDir %s\n' "$top/$build/tools/agentx/korvsnmp-snmpd.so" \
+        "$dir/module-state" >>"$dir/snmpd.conf"
+    subagent=
+else
+    printf 'master agentx\nagentXSocket %s\n' "$dir/agentx.sock" >>"$dir/snmpd.conf"
+    subagent=", korvsnmp-agentx"
+fi
 SNMP_PERSISTENT_DIR="$dir/snmpd-state" setsid /usr/sbin/snmpd -f -C -c "$dir/snmpd.conf" -M '' -m '' \
     -Lf "$dir/snmpd.log" &
-pids="$pids $!"
-waitfor snmpd $! "$dir/snmpd.log" test -S "$dir/agentx.sock"
+snmpd=$!
+pids="$pids $snmpd"
+# What answers korvsnmpMIB: snmpd itself with the module, else the subagent.
+served="snmpd $snmpd $dir/snmpd.log"
 
-echo "==> starting korvsnmp-agentx"
-setsid "$build/tools/agentx/korvsnmp-agentx" --agentx-socket "$dir/agentx.sock" \
-    --state-dir "$dir/agentx-state" >"$dir/korvsnmp-agentx.log" 2>&1 &
-agentx=$!
-pids="$pids $agentx"
+if [ -z "$module" ]; then
+    waitfor snmpd $snmpd "$dir/snmpd.log" test -S "$dir/agentx.sock"
+    echo "==> starting korvsnmp-agentx"
+    setsid "$build/tools/agentx/korvsnmp-agentx" --agentx-socket "$dir/agentx.sock" \
+        --state-dir "$dir/agentx-state" >"$dir/korvsnmp-agentx.log" 2>&1 &
+    agentx=$!
+    pids="$pids $agentx"
+    served="korvsnmp-agentx $agentx $dir/korvsnmp-agentx.log"
+fi
 
 mibs="/usr/share/snmp/mibs/ietf:/usr/share/mibs/ietf:$top/mibs/base:$top/mibs"
 client="-v2c -c public -M $mibs -m KORVSNMP-MIB 127.0.0.1:$port"
 # shellcheck disable=SC2086
-waitfor korvsnmp-agentx $agentx "$dir/korvsnmp-agentx.log" \
-    sh -c "snmpget -Oqv $client korvSampleTime.0 | grep -q '^[0-9]'"
+waitfor $served sh -c "snmpget -Oqv $client korvSampleTime.0 | grep -q '^[0-9]'"
 
 echo "==> snmpwalk $client korvsnmpMIB"
 # shellcheck disable=SC2086
@@ -124,5 +142,5 @@ snmpwalk $client korvsnmpMIB
 echo
 echo "Walk again with:"
 echo "  snmpwalk $client korvsnmpMIB"
-echo "Stop what this script started (${names}snmpd, korvsnmp-agentx) with:"
+echo "Stop what this script started (${names}snmpd$subagent) with:"
 echo "  $(stop_command)"

@@ -176,7 +176,7 @@ def main():
                 if host:
                     agent_env["KORVPLATFORM_HOST"] = os.path.abspath(host)
                 agent = subprocess.Popen([AGENTX, "--agentx-socket", scratch + "/agentx.sock",
-                                          "--interval", str(interval), "--persistent-dir",
+                                          "--interval", str(interval), "--state-dir",
                                           scratch + "/agentx-state"], env=agent_env,
                                          stderr=open(scratch + "/agentx.log", "a"))
                 children.append(agent)

@@ -5,6 +5,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -225,8 +226,10 @@ TEST(AgentxSnapshot, NamesBecomeValidUtf8OfAtMost255Bytes)
         result["lun"][0]["lun_name"] = name;
         SampleMemory memory;
         const Snapshot snapshot = BuildSnapshot(result, {}, memory, 5, 0, {});
-        const Entry *entry = snapshot.Find(Objects({10, 1, 3, 1}));  // korvLunName.1
-        ASSERT_NE(entry, nullptr);
+        const Oid lunName = Objects({10, 1, 3, 1});  // korvLunName.1
+        const auto entry = std::find_if(snapshot.entries.begin(), snapshot.entries.end(),
+                                        [&](const Entry &each) { return each.oid == lunName; });
+        ASSERT_NE(entry, snapshot.entries.end());
         EXPECT_EQ(entry->value.text, served);
         EXPECT_LE(entry->value.text.size(), 255u);
         EXPECT_EQ(korvcatalogue::ValidUtf8(entry->value.text), entry->value.text);
@@ -415,6 +418,25 @@ TEST(AgentxProgram, VersionAnswersLikeTheOtherPrograms)
     EXPECT_TRUE(read);
     EXPECT_EQ(std::string(line), std::string("korvsnmp-agentx ") + KORVSNMP_PROJECT_VERSION + "\n");
     EXPECT_EQ(status, 0);
+}
+
+// The module's snmpd.conf tokens are read by the command line's own rules.
+TEST(AgentxOptions, ModuleTokens)
+{
+    uint32_t seconds = 7;
+    std::string error;
+    EXPECT_FALSE(ParseSeconds(kIntervalToken, "0", seconds, error));
+    EXPECT_EQ(error, "korvsnmpInterval wants whole seconds from 1 to 86400, not \"0\"");
+    EXPECT_EQ(seconds, 7u);
+    EXPECT_TRUE(ParseSeconds(kIntervalToken, "86400", seconds, error));
+    EXPECT_EQ(seconds, 86400u);
+
+    std::string directory = "/kept";
+    EXPECT_FALSE(ParsePath(kStateDirToken, "", directory, error));
+    EXPECT_EQ(error, "korvsnmpStateDir needs a non-empty value");
+    EXPECT_EQ(directory, "/kept");
+    EXPECT_TRUE(ParsePath(kStateDirToken, "/var/lib/snmp/korvsnmp", directory, error));
+    EXPECT_EQ(directory, "/var/lib/snmp/korvsnmp");
 }
 
 }  // namespace

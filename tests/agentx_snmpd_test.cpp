@@ -1,14 +1,17 @@
-// korvsnmp-agentx under Debian's snmpd, read with net-snmp's own client
-// tools, against the test collector: every object matches the library's
-// result for the same reply, the Counter64 counters and their sums included;
-// the walk answers from the last snapshot while the collector stalls; the
-// collector goes away and comes back; snmpd restarts and the subagent
-// registers again; a restarted subagent finds every device under its index.
+// KORVSNMP-MIB under Debian's snmpd through both front ends, the subagent
+// korvsnmp-agentx and the module korvsnmp-snmpd.so (dlmod), read with
+// net-snmp's own client tools, against the test collector: every object
+// matches the library's result for the same reply, the Counter64 counters
+// and their sums included; the walk answers from the last snapshot while the
+// collector stalls; the collector goes away and comes back; snmpd restarts
+// and serves again; snmpd stops or reloads while the module samples; a
+// restarted front end finds every device under its index.
 #include <netinet/in.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cctype>
 #include <chrono>
 #include <filesystem>
@@ -250,7 +253,9 @@ std::map<std::string, std::string> ExpectedObjects(const Json::Value &result)
     return objects;
 }
 
-class AgentxUnderSnmpd : public ::testing::Test {
+enum class FrontEnd { Subagent, Module };
+
+class UnderSnmpd : public ::testing::TestWithParam<FrontEnd> {
 protected:
     void SetUp() override
     {
@@ -258,38 +263,77 @@ protected:
         ASSERT_TRUE(nodes_.Make(2, whyNot)) << whyNot;  // its directory holds everything else too
         std::ofstream(Path("host.json")) << HostDescription(nodes_);
         ASSERT_EQ(access(kSnmpd, X_OK), 0) << "snmpd is not installed";
-        std::ofstream(Path("snmpd.conf")) << "agentaddress udp:127.0.0.1:" << port_
-            << "\nmaster agentx\nagentXSocket " << Path("agentx.sock") << "\nagentXTimeout 1\nview korvview"
-            << " included .1.3.6.1.3.7947\nrocommunity public 127.0.0.1 -V korvview\n";
-        StartSnmpd();
+        std::ofstream conf(Path("snmpd.conf"));
+        conf << "agentaddress udp:127.0.0.1:" << port_ << "\nview korvview included .1.3.6.1.3.7947\n"
+             << "rocommunity public 127.0.0.1 -V korvview\n";
+        if (Module()) {  // loaded twice: the second load adds nothing
+            for (int load = 0; load < 2; ++load)
+                conf << "dlmod korvsnmp " KORVSNMP_SNMPD_MODULE_PATH "\nkorvsnmpInterval 3600\n";
+            conf << "korvsnmpStateDir " << StateDir() << "\n";
+        } else
+            conf << "master agentx\nagentXSocket " << Path("agentx.sock") << "\nagentXTimeout 1\n";
     }
 
     void TearDown() override { unsetenv("KORVPLATFORM_HOST"), korvstandin::UseProcessHost(); }
 
+    bool Module() const { return GetParam() == FrontEnd::Module; }
+
     std::string Path(const char *name) const { return nodes_.Directory() + "/" + name; }
 
+    // Where the front end keeps its row indexes: the subagent's --state-dir (also net-snmp's
+    // state), the module's korvsnmpStateDir (beside snmpd's own state).
+    std::string StateDir() const { return Path(Module() ? "module-state" : "state"); }
+
+    // The environment of what samples: the connect redirection and the described appliance.
+    std::vector<std::string> SamplingEnvironment() const
+    {
+        std::vector<std::string> words = korvtest::RedirectedChildVariables();
+        words.insert(words.end(), {"SNMP_PERSISTENT_DIR=" + Path("state"), "KORVPLATFORM_HOST=" + Path("host.json")});
+#ifdef KORVSNMP_SANITIZER_RUNTIME
+        // snmpd is not built with the sanitizers: their runtime must come first for the
+        // module, and snmpd's own leaks are known.
+        if (Module()) {
+            words.front().insert(words.front().find('=') + 1, KORVSNMP_SANITIZER_RUNTIME " ");
+            words.push_back("LSAN_OPTIONS=suppressions=" KORVSNMP_SNMPD_LEAKS);
+        }
+#endif
+        return words;
+    }
 
     void StartSnmpd()
     {
         fs::remove(Path("agentx.sock"));  // a killed snmpd leaves it behind
         snmpd_.reset();  // run through env(1), as the subagent is
-        snmpd_.emplace("/usr/bin/env", std::vector<std::string>{"SNMP_PERSISTENT_DIR=" + Path("state"),
-            kSnmpd, "-f", "-C", "-c", Path("snmpd.conf"), "-M", "", "-m", "", "-Lo"}, Path("snmpd.out"));
-        ASSERT_TRUE(PollUntil([&] { return fs::exists(Path("agentx.sock")); })) << snmpd_->Log();
+        std::vector<std::string> words = Module() ? SamplingEnvironment()
+                                                  : std::vector<std::string>{"SNMP_PERSISTENT_DIR=" + Path("state")};
+        words.insert(words.end(), {kSnmpd, "-f", "-C", "-c", Path("snmpd.conf"), "-M", "", "-m", "", "-Lo"});
+        snmpd_.emplace("/usr/bin/env", words, Path("snmpd.out"));
+        if (!Module()) {
+            ASSERT_TRUE(PollUntil([&] { return fs::exists(Path("agentx.sock")); })) << snmpd_->Log();
+        }
     }
 
-    // Starts the subagent, which samples at once, and waits for the sample of `time`.
-    void StartSubagent(unsigned time)
+    // Starts snmpd and, for the subagent, the subagent; what samples does so at once.
+    // Waits for the sample of `time`.
+    void StartServing(unsigned time)
     {
-        std::vector<std::string> words = korvtest::RedirectedChildVariables();
-        words.insert(words.end(), {"SNMP_PERSISTENT_DIR=" + Path("state"),
-            "KORVPLATFORM_HOST=" + Path("host.json"),
-            KORVSNMP_AGENTX_PATH, "--agentx-socket", Path("agentx.sock"), "--interval", "3600",
-            "--ping-interval", "1", "--state-dir", Path("state")});
-        subagent_.reset();
-        subagent_.emplace("/usr/bin/env", words, Path("agentx.out"));
-        ASSERT_TRUE(WaitForSample(time)) << subagent_->Log();
+        StartSnmpd();
+        if (!Module()) {
+            std::vector<std::string> words = SamplingEnvironment();
+            words.insert(words.end(), {KORVSNMP_AGENTX_PATH, "--agentx-socket", Path("agentx.sock"), "--interval",
+                                       "3600", "--ping-interval", "1", "--state-dir", StateDir()});
+            subagent_.reset();
+            subagent_.emplace("/usr/bin/env", words, Path("agentx.out"));
+        }
+        ASSERT_TRUE(WaitForSample(time)) << Serving().Log();
     }
+
+    // The process that samples: the subagent, or snmpd with the module.
+    korvtest::CollectorProcess &Serving() { return Module() ? *snmpd_ : *subagent_; }
+
+    // A sample at once: SIGHUP to the subagent; for the module, SIGHUP to snmpd,
+    // which reloads it, and a loaded module samples at once.
+    void SampleNow() { kill(Serving().Pid(), SIGHUP); }
 
     // A walk shows each value's type ("Gauge32: 5"), so that a wrong one shows; a get does not.
     std::string Client(const std::string &tool, const std::string &arguments) const
@@ -312,7 +356,7 @@ protected:
         collector_->Script({"", false});
         auto sockets = [] { return Occurrences(ReadWholeFile("/proc/net/unix"), korvtest::PrivateCollectorPath()); };
         const auto idle = sockets();
-        kill(subagent_->Pid(), SIGHUP);
+        SampleNow();
         ASSERT_TRUE(PollUntil([&] { return sockets() > idle; }));
     }
 
@@ -362,11 +406,14 @@ protected:
     std::optional<korvtest::CollectorProcess> snmpd_, subagent_;  // the subagent declared last: stopped first
 };
 
-TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndARestartedSnmpdFindsTheSubagentAgain)
+INSTANTIATE_TEST_SUITE_P(FrontEnds, UnderSnmpd, ::testing::Values(FrontEnd::Subagent, FrontEnd::Module),
+                         [](const auto &info) { return info.param == FrontEnd::Module ? "Module" : "Subagent"; });
+
+TEST_P(UnderSnmpd, EveryObjectIsTheLibrarysResultAndARestartedSnmpdServesAgain)
 {
     const Json::Value reply = DescribedReply(nodes_, 1795000000, 7);
     collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
-    StartSubagent(1795000000);
+    StartServing(1795000000);
 
     const std::string walk = Client("snmpwalk", "korvsnmpMIB");
     const Json::Value result = LibraryResult(reply);
@@ -385,16 +432,20 @@ TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndARestartedSnmpdFindsTh
     for (const auto &[tool, arguments, expected] : edges)
         EXPECT_EQ(Client(tool, arguments), expected) << tool << " " << arguments;
 
+    if (Module())  // the restarted snmpd loads the module afresh, which samples
+        collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
     StartSnmpd();  // the old one killed
-    EXPECT_TRUE(WaitForSample(1795000000)) << subagent_->Log();
-    EXPECT_EQ(subagent_->Stop(SIGTERM), 0) << subagent_->Log();
-    EXPECT_THAT(Client("snmpwalk", "korvsnmpMIB"), ::testing::HasSubstr("No more variables left"));
+    EXPECT_TRUE(WaitForSample(1795000000)) << Serving().Log();
+    EXPECT_EQ(Serving().Stop(SIGTERM), 0) << Serving().Log();
+    if (!Module()) {
+        EXPECT_THAT(Client("snmpwalk", "korvsnmpMIB"), ::testing::HasSubstr("No more variables left"));
+    }
 }
 
-TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCountedAndLoggedOnce)
+TEST_P(UnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCountedAndLoggedOnce)
 {
     collector_->Script({korvtest::Frame(korvtest::JsonText(DescribedReply(nodes_, 1795000000, 1)))});
-    StartSubagent(1795000000);
+    StartServing(1795000000);
     const std::string before = Client("snmpwalk", "korvsnmpMIB");
 
     // The sampler waits in the library; the walk answers from the previous snapshot at once.
@@ -406,7 +457,7 @@ TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCounte
     // Gone: the held exchange fails, then one more sample fails.
     collector_.reset();  // its socket file goes with it
     ASSERT_TRUE(Answers("korvFailedSamples.0", "1"));
-    kill(subagent_->Pid(), SIGHUP);
+    SampleNow();
     ASSERT_TRUE(Answers("korvFailedSamples.0", "2"));
     EXPECT_EQ(Objects(Client("snmpwalk", "korvsnmpMIB")), Objects(before));
 
@@ -415,25 +466,63 @@ TEST_F(AgentxUnderSnmpd, AStalledCollectorLeavesTheLastSampleAndAGoneOneIsCounte
     Json::Value reply = DescribedReply(nodes_, 1795000060, 2);
     reply["data"].removeMember("DiskIO");
     collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
-    kill(subagent_->Pid(), SIGHUP);
-    ASSERT_TRUE(WaitForSample(1795000060)) << subagent_->Log();
+    SampleNow();
+    ASSERT_TRUE(WaitForSample(1795000060)) << Serving().Log();
     EXPECT_EQ(Client("snmpgetnext", "korvDiskTotal korvDiskTable"), "korvIfDevice.1 = total\nkorvIfDevice.1 = total\n");
-    EXPECT_EQ(Occurrences(subagent_->Log(), "No statistics from the collector; answering from the last sample"), 1);
-    EXPECT_EQ(Occurrences(subagent_->Log(), "The collector answers again"), 1) << subagent_->Log();
+    if (!Module()) {  // the module's lines go to the system log, as snmpd's modules' do
+        EXPECT_EQ(Occurrences(Serving().Log(), "No statistics from the collector; answering from the last sample"), 1);
+        EXPECT_EQ(Occurrences(Serving().Log(), "The collector answers again"), 1) << Serving().Log();
+    }
 
-    // Stalled again: SIGTERM stops it within the process wait, not the library's 90 s.
+    // Stalled again: SIGTERM stops the subagent, or snmpd with the module's thread
+    // broken off and joined, within the process wait, not the library's 90 s.
     StallASample();
-    EXPECT_EQ(subagent_->Stop(SIGTERM), 0) << subagent_->Log();
+    EXPECT_EQ(Serving().Stop(SIGTERM), 0) << Serving().Log();
 }
 
-TEST_F(AgentxUnderSnmpd, ARestartedSubagentFindsEveryDeviceUnderItsIndexAndANewOneUnderANewIndex)
+// snmpd reloads on SIGHUP: the module (loaded twice here) is unloaded and loaded again,
+// each time ending its sampling thread and starting a new one, while walks go on.
+TEST_P(UnderSnmpd, ReloadsUnderWalksLeaveOneSamplingThreadAndTheLastSample)
+{
+    if (!Module())
+        GTEST_SKIP() << "snmpd's reload concerns the module only";
+    collector_->Script({korvtest::Frame(korvtest::JsonText(DescribedReply(nodes_, 1795000000, 3)))});
+    StartServing(1795000000);
+    const std::string before = Client("snmpbulkwalk", "korvsnmpMIB");
+    const std::string tasks = "/proc/" + std::to_string(snmpd_->Pid()) + "/task";
+    const auto threads = [&] { return std::distance(fs::directory_iterator(tasks), fs::directory_iterator()); };
+    ASSERT_EQ(threads(), 2) << snmpd_->Log();
+
+    std::vector<std::string> walks;
+    std::atomic<bool> reloading{true};
+    std::thread walker([&] {
+        while (reloading)
+            walks.push_back(Client("snmpbulkwalk", "korvsnmpMIB"));
+    });
+    // Each reloaded module samples; the collector closes unscripted connections: a failed sample.
+    for (int reload = 1; reload <= 3; ++reload) {
+        kill(snmpd_->Pid(), SIGHUP);
+        EXPECT_TRUE(Answers("korvFailedSamples.0", std::to_string(reload))) << snmpd_->Log();
+    }
+    reloading = false;
+    walker.join();
+
+    ASSERT_FALSE(walks.empty());
+    for (const std::string &walk : walks)
+        EXPECT_EQ(Objects(walk), Objects(before));
+    EXPECT_EQ(threads(), 2) << snmpd_->Log();
+    EXPECT_EQ(snmpd_->Stop(SIGTERM), 0) << snmpd_->Log();
+}
+
+// The subagent restarts, or snmpd with the module: both read the indexes back from the state directory.
+TEST_P(UnderSnmpd, ARestartedFrontEndFindsEveryDeviceUnderItsIndexAndANewOneUnderANewIndex)
 {
     collector_->Script({korvtest::Frame(korvtest::JsonText(DescribedReply(nodes_, 1795000000, 1)))});
-    StartSubagent(1795000000);
+    StartServing(1795000000);
     const std::map<std::string, std::string> before = IndexesOf(Client("snmpwalk", "korvsnmpMIB"));
     ASSERT_EQ(before.size(), 13u) << Client("snmpwalk", "korvsnmpMIB");  // 3 disks, 6 interface rows, 2 volumes, 2 LUNs
-    EXPECT_EQ(subagent_->Stop(SIGTERM), 0) << subagent_->Log();
-    EXPECT_TRUE(fs::exists(Path("state") + std::string("/row-indexes")));
+    EXPECT_EQ(Serving().Stop(SIGTERM), 0) << Serving().Log();
+    EXPECT_TRUE(fs::exists(StateDir() + "/row-indexes"));
 
     // The next run's collector lacks the first device of each section, so that the rows come in another
     // order, and has one LUN more.
@@ -446,7 +535,7 @@ TEST_F(AgentxUnderSnmpd, ARestartedSubagentFindsEveryDeviceUnderItsIndexAndANewO
     reply["data"]["iSCSI"].append(reply["data"]["iSCSI"][0]);
     reply["data"]["iSCSI"][1]["device"] = newLun;
     collector_->Script({korvtest::Frame(korvtest::JsonText(reply))});
-    StartSubagent(1795000060);
+    StartServing(1795000060);
     std::map<std::string, std::string> after = IndexesOf(Client("snmpwalk", "korvsnmpMIB"));
     ASSERT_EQ(after.count("korvLunUuid " + newLun), 1u);
     EXPECT_EQ(after["korvLunUuid " + newLun], "3");  // after the two of the first run

@@ -42,6 +42,7 @@ korvsnmp-tools + /usr/lib/systemd/system/korvsnmpcd.service
 korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-textfile.service
 korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-textfile.timer
 korvsnmp-tools + /usr/share/man/man1/korvsnmp-stat.1.gz
+korvsnmp-tools + /usr/lib/korvsnmp/korvsnmp-snmpd.so
 korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
 LIST
 
@@ -64,6 +65,10 @@ TMPDIR="$work/tmp" lintian --fail-on error,warning --suppress-tags initial-uploa
 for package in libkorvsnmp1 korvsnmp-tools; do dpkg -x "$(deb $package)" "$work/root"; done
 stat="$work/root/usr/bin/korvsnmp-stat"
 readelf -d "$stat" | grep -q 'R.*PATH' && fail "the packaged korvsnmp-stat has an RPATH"
+module="$work/root/usr/lib/korvsnmp/korvsnmp-snmpd.so"
+readelf -d "$module" | grep -q 'R.*PATH' && fail "the packaged snmpd module has an RPATH"
+nm -D --defined-only "$module" | awk '$2 == "T" {print $3}' | sort | tr '\n' ' ' |
+    grep -qx 'deinit_korvsnmp init_korvsnmp ' || fail "the snmpd module exports more than its entry points"
 out=$(LD_LIBRARY_PATH="$work/root/usr/lib" "$stat" --version)
 [ "$out" = "korvsnmp-stat ${version%-*}" ] || fail "--version said: $out"
 LD_LIBRARY_PATH="$work/root/usr/lib" "$stat" --help | head -1 | grep -q '^Usage: korvsnmp-stat' ||

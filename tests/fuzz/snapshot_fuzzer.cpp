@@ -2,12 +2,17 @@
 // BuildSnapshot three times with one memory (as samples follow each other),
 // and as the row index file's text. Nothing may crash, throw or leak, and
 // every snapshot must be what the front ends can serve: ascending OIDs of
-// known objects, names of valid UTF-8 of at most 255 bytes, the file text of
-// the indexes read back as written.
+// known objects, names of valid UTF-8 of at most 255 bytes, a layout for
+// answering that finds each object with its value under its own name and the
+// next one after it, the file text of the indexes read back as written.
+#include "encoded_snapshot.h"  // net-snmp's configuration before its headers
+
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
 #include <memory>
+#include <string>
+#include <vector>
 
 #include <json/reader.h>
 
@@ -37,6 +42,19 @@ void Check(const Snapshot &snapshot)
             Require(entry.value.text.size() <= korvcatalogue::kAdminStringSize);
             Require(korvcatalogue::ValidUtf8(entry.value.text) == entry.value.text);
         }
+    }
+    const EncodedSnapshot encoded(snapshot);
+    Require(encoded.Objects().size() == snapshot.entries.size());
+    for (size_t i = 0; i < snapshot.entries.size(); ++i) {
+        const Entry &entry = snapshot.entries[i];
+        const std::vector<oid> name(entry.oid.begin(), entry.oid.end());
+        const EncodedObject *found = encoded.Find(name.data(), name.size());
+        Require(found == &encoded.Objects()[i]);
+        Require(found->kind == entry.value.type);
+        Require(found->number == entry.value.number);
+        Require(std::string(encoded.Text(*found), found->textLength) == entry.value.text);
+        const EncodedObject *next = encoded.FindNext(name.data(), name.size());
+        Require(next == (i + 1 < encoded.Objects().size() ? &encoded.Objects()[i + 1] : nullptr));
     }
 }
 

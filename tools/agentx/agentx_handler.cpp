@@ -1,4 +1,5 @@
-// Answers KORVSNMP-MIB's subtree from the latest snapshot.
+// Answers KORVSNMP-MIB's subtree from the latest snapshot, in the subagent
+// and in snmpd alike.
 #include "agentx_handler.h"
 
 #include <net-snmp/net-snmp-config.h>
@@ -9,6 +10,7 @@
 
 #include <algorithm>
 #include <iterator>
+#include <new>
 
 #include "mib_layout.h"
 
@@ -22,82 +24,75 @@ constexpr char kRegistrationName[] = "korvsnmp";
 const Sampler *theSampler = nullptr;
 netsnmp_handler_registration *theRegistration = nullptr;
 
-Oid ToOid(const oid *name, size_t length)
+// A name that no object of the snapshot has: noSuchInstance when a column
+// or scalar of the MIB names it, noSuchObject otherwise.
+int MissReason(const oid *name, size_t length)
 {
-    return Oid(name, name + length);  // sub-identifiers are 32-bit on the wire
+    const Oid asked(name, name + length);  // sub-identifiers are 32-bit on the wire
+    return IsInstanceOfKnownObject(asked) ? SNMP_NOSUCHINSTANCE : SNMP_NOSUCHOBJECT;
 }
 
-void SetValue(netsnmp_variable_list *variable, const Value &value, const Snapshot &snapshot,
-              const Sampler &sampler)
+void SetUnsigned(netsnmp_variable_list *variable, u_char type, uint64_t number)
 {
-    auto setUnsigned = [variable](u_char type, uint64_t number) {
-        u_long narrow = static_cast<u_long>(std::min<uint64_t>(number, 0xFFFFFFFFull));
-        snmp_set_var_typed_value(variable, type, &narrow, sizeof narrow);
-    };
-    switch (value.type) {
-    case ValueType::Gauge32:
-        setUnsigned(ASN_GAUGE, value.number);
-        break;
-    case ValueType::Counter32:
-        setUnsigned(ASN_COUNTER, value.number);
-        break;
-    case ValueType::Unsigned32:
-        setUnsigned(ASN_UNSIGNED, value.number);
-        break;
+    const u_long narrow = static_cast<u_long>(std::min<uint64_t>(number, 0xFFFFFFFFull));
+    snmp_set_var_typed_value(variable, type, &narrow, sizeof narrow);
+}
+
+void SetValue(netsnmp_variable_list *variable, const EncodedObject &object,
+              const EncodedSnapshot &snapshot, const Sampler &sampler)
+{
+    switch (object.kind) {
     case ValueType::Integer: {
-        long integer = static_cast<long>(value.number);
-        snmp_set_var_typed_value(variable, ASN_INTEGER, &integer, sizeof integer);
+        const long integer = static_cast<long>(object.number);
+        snmp_set_var_typed_value(variable, object.type, &integer, sizeof integer);
         break;
     }
     case ValueType::Counter64: {
-        counter64 wide{static_cast<u_long>(value.number >> 32),
-                       static_cast<u_long>(value.number & 0xFFFFFFFFull)};
-        snmp_set_var_typed_value(variable, ASN_COUNTER64, &wide, sizeof wide);
+        const counter64 wide{static_cast<u_long>(object.number >> 32),
+                             static_cast<u_long>(object.number & 0xFFFFFFFFull)};
+        snmp_set_var_typed_value(variable, object.type, &wide, sizeof wide);
         break;
     }
     case ValueType::Text:
-        snmp_set_var_typed_value(variable, ASN_OCTET_STR, value.text.data(), value.text.size());
-        break;
-    case ValueType::TimeStamp:
-        setUnsigned(ASN_TIMETICKS, value.number);
+        snmp_set_var_typed_value(variable, object.type, snapshot.Text(object), object.textLength);
         break;
     case ValueType::SnapshotAge: {
-        auto age = std::chrono::duration_cast<std::chrono::seconds>(
-            std::chrono::steady_clock::now() - snapshot.taken);
-        setUnsigned(ASN_UNSIGNED, static_cast<uint64_t>(std::max<int64_t>(age.count(), 0)));
+        const auto age = std::chrono::duration_cast<std::chrono::seconds>(
+            std::chrono::steady_clock::now() - snapshot.Taken());
+        SetUnsigned(variable, object.type, static_cast<uint64_t>(std::max<int64_t>(age.count(), 0)));
         break;
     }
     case ValueType::FailedSamples:
-        setUnsigned(ASN_COUNTER, sampler.FailedSamples());
+        SetUnsigned(variable, object.type, sampler.FailedSamples());
+        break;
+    case ValueType::Gauge32:
+    case ValueType::Counter32:
+    case ValueType::Unsigned32:
+    case ValueType::TimeStamp:
+        SetUnsigned(variable, object.type, object.number);
         break;
     }
 }
 
-int HandleRequests(netsnmp_mib_handler *, netsnmp_handler_registration *,
-                   netsnmp_agent_request_info *info, netsnmp_request_info *requests)
+void Answer(netsnmp_agent_request_info *info, netsnmp_request_info *requests)
 {
-    if (theSampler == nullptr)
-        return SNMP_ERR_GENERR;
-    const std::shared_ptr<const Snapshot> snapshot = theSampler->Current();
+    const std::shared_ptr<const EncodedSnapshot> snapshot = theSampler->Current();
     for (netsnmp_request_info *request = requests; request != nullptr; request = request->next) {
         if (request->processed)
             continue;
         netsnmp_variable_list *variable = request->requestvb;
-        const Oid asked = ToOid(variable->name, variable->name_length);
         switch (info->mode) {
         case MODE_GET:
-            if (const Entry *entry = snapshot->Find(asked))
-                SetValue(variable, entry->value, *snapshot, *theSampler);
+            if (const EncodedObject *object = snapshot->Find(variable->name, variable->name_length))
+                SetValue(variable, *object, *snapshot, *theSampler);
             else
                 netsnmp_set_request_error(info, request,
-                                          IsInstanceOfKnownObject(asked) ? SNMP_NOSUCHINSTANCE
-                                                                         : SNMP_NOSUCHOBJECT);
+                                          MissReason(variable->name, variable->name_length));
             break;
         case MODE_GETNEXT:
-            if (const Entry *entry = snapshot->FindNext(asked)) {
-                std::vector<oid> name(entry->oid.begin(), entry->oid.end());
-                snmp_set_var_objid(variable, name.data(), name.size());
-                SetValue(variable, entry->value, *snapshot, *theSampler);
+            if (const EncodedObject *object = snapshot->FindNext(variable->name, variable->name_length)) {
+                snmp_set_var_objid(variable, snapshot->Name(*object), object->nameLength);
+                SetValue(variable, *object, *snapshot, *theSampler);
             }
             // Past the last object: left unanswered, so the agent goes on
             // to the next subtree (endOfMibView at the end of the view).
@@ -106,6 +101,20 @@ int HandleRequests(netsnmp_mib_handler *, netsnmp_handler_registration *,
             netsnmp_set_request_error(info, request, SNMP_ERR_NOTWRITABLE);
             break;
         }
+    }
+}
+
+int HandleRequests(netsnmp_mib_handler *, netsnmp_handler_registration *,
+                   netsnmp_agent_request_info *info, netsnmp_request_info *requests)
+{
+    if (theSampler == nullptr)
+        return SNMP_ERR_GENERR;
+    // No exception may cross net-snmp's C frames (in snmpd that would end snmpd).
+    try {
+        Answer(info, requests);
+    } catch (const std::bad_alloc &) {
+        syslog(LOG_ERR, "%s:%d Out of memory while answering", kUnit, __LINE__);
+        return SNMP_ERR_GENERR;
     }
     return SNMP_ERR_NOERROR;
 }

@@ -1,6 +1,7 @@
-// KORVSNMP-MIB's subtree in net-snmp's agent: one handler that answers GET
-// and GETNEXT (GETBULK arrives as GETNEXTs) from the sampler's latest
-// snapshot, and never calls the library.
+// KORVSNMP-MIB's subtree in net-snmp's agent (the subagent's or snmpd's own):
+// one handler that answers GET and GETNEXT (GETBULK arrives as GETNEXTs)
+// from the sampler's latest snapshot in O(log n), without copying it, and
+// never calls the library.
 #ifndef KORVAGENTX_AGENTX_HANDLER_H
 #define KORVAGENTX_AGENTX_HANDLER_H
 

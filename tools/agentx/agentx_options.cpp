@@ -1,4 +1,4 @@
-// korvsnmp-agentx's command line.
+// korvsnmp-agentx's command line and the module's tokens.
 #include "agentx_options.h"
 
 #include <cerrno>
@@ -10,19 +10,34 @@ namespace {
 
 constexpr uint32_t kMaxSeconds = 86400;
 
-bool ParseSeconds(const std::string &text, uint32_t &seconds)
+}  // namespace
+
+bool ParseSeconds(const std::string &name, const std::string &text, uint32_t &seconds,
+                  std::string &error)
 {
-    if (text.empty() || text.find_first_not_of("0123456789") != std::string::npos)
-        return false;
     errno = 0;
-    unsigned long long value = std::strtoull(text.c_str(), nullptr, 10);
-    if (errno != 0 || value < 1 || value > kMaxSeconds)
+    const unsigned long long value =
+        text.empty() || text.find_first_not_of("0123456789") != std::string::npos
+            ? 0
+            : std::strtoull(text.c_str(), nullptr, 10);
+    if (errno != 0 || value < 1 || value > kMaxSeconds) {
+        error = name + " wants whole seconds from 1 to 86400, not \"" + text + "\"";
         return false;
+    }
     seconds = static_cast<uint32_t>(value);
     return true;
 }
 
-}  // namespace
+bool ParsePath(const std::string &name, const std::string &text, std::string &path,
+                    std::string &error)
+{
+    if (text.empty()) {
+        error = name + " needs a non-empty value";
+        return false;
+    }
+    path = text;
+    return true;
+}
 
 const char kUsage[] =
     "Usage: korvsnmp-agentx [--agentx-socket PATH] [--interval SECONDS]\n"
@@ -64,14 +79,13 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
         }
         const std::string &value = arguments[++i];
         if (argument == "--agentx-socket" || argument == "--state-dir" || argument == "--persistent-dir") {
-            if (value.empty()) {
-                error = argument + " needs a non-empty value";
+            if (!ParsePath(argument, value,
+                           argument == "--agentx-socket" ? options.agentxSocket : options.stateDir, error))
                 return false;
-            }
-            (argument == "--agentx-socket" ? options.agentxSocket : options.stateDir) = value;
-        } else if (!ParseSeconds(value, argument == "--interval" ? options.intervalSeconds
-                                                                 : options.pingSeconds)) {
-            error = argument + " wants whole seconds from 1 to 86400, not \"" + value + "\"";
+        } else if (!ParseSeconds(argument, value,
+                                 argument == "--interval" ? options.intervalSeconds
+                                                          : options.pingSeconds,
+                                 error)) {
             return false;
         }
     }

@@ -9,12 +9,10 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <algorithm>
-#include <atomic>
-#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 
+#include "agent_uptime.h"
 #include "agentx_handler.h"
 #include "agentx_options.h"
 #include "sampler.h"
@@ -26,27 +24,6 @@ constexpr char kAppName[] = "korvsnmp-agentx";
 volatile sig_atomic_t stopRequested = 0;
 int signalPipe[2] = {-1, -1};
 korvagentx::Sampler *theSampler = nullptr;
-
-// The master agent's sysUpTime for the sampling thread. net-snmp keeps its
-// own in step with the master on this thread; the thread reads the start it
-// implies, as milliseconds of the steady clock.
-using SteadyMs = std::chrono::milliseconds;
-std::atomic<int64_t> masterStartMs{0};
-
-int64_t SteadyNowMs()
-{
-    return std::chrono::duration_cast<SteadyMs>(std::chrono::steady_clock::now().time_since_epoch()).count();
-}
-
-void PublishUpTime()
-{
-    masterStartMs = SteadyNowMs() - static_cast<int64_t>(netsnmp_get_agent_uptime()) * 10;
-}
-
-uint32_t MasterUpTime()
-{
-    return static_cast<uint32_t>(std::max<int64_t>(SteadyNowMs() - masterStartMs.load(), 0) / 10);
-}
 
 void OnStop(int)
 {
@@ -121,8 +98,8 @@ int main(int argc, char **argv)
     sigaddset(&signals, SIGHUP);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
 
-    PublishUpTime();
-    korvagentx::Sampler sampler(options.intervalSeconds, options.stateDir, MasterUpTime);
+    korvagentx::PublishAgentUpTime();
+    korvagentx::Sampler sampler(options.intervalSeconds, options.stateDir, korvagentx::AgentUpTime);
     theSampler = &sampler;
     if (pipe2(signalPipe, O_CLOEXEC | O_NONBLOCK) != 0) {
         std::fprintf(stderr, "%s: cannot create a pipe\n", kAppName);
@@ -136,7 +113,7 @@ int main(int argc, char **argv)
     netsnmp_ds_set_int(NETSNMP_DS_APPLICATION_ID, NETSNMP_DS_AGENT_AGENTX_PING_INTERVAL,
                        static_cast<int>(options.pingSeconds));
     register_readfd(signalPipe[0], DrainSignalPipe, nullptr);
-    PublishUpTime();
+    korvagentx::PublishAgentUpTime();
     sampler.Start();
 
     struct sigaction stop {};
@@ -151,7 +128,7 @@ int main(int argc, char **argv)
 
     while (registered && !stopRequested) {
         agent_check_and_process(1);
-        PublishUpTime();
+        korvagentx::PublishAgentUpTime();
     }
 
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);

@@ -31,6 +31,23 @@ constexpr auto kInterruptRepeat = std::chrono::milliseconds(50);
 
 void IgnoreInterrupt(int) {}
 
+std::string IndexPath(const std::string &stateDirectory)
+{
+    return stateDirectory + "/" + kIndexFileName;
+}
+
+// The sampling thread takes none of the process's asynchronous signals (they
+// belong to the program that it runs in) but the interrupt; faults stay
+// deliverable.
+void KeepOnlyTheInterrupt()
+{
+    sigset_t blocked;
+    sigfillset(&blocked);
+    for (int signal : {kInterruptSignal, SIGSEGV, SIGBUS, SIGFPE, SIGILL, SIGTRAP, SIGABRT})
+        sigdelset(&blocked, signal);
+    pthread_sigmask(SIG_SETMASK, &blocked, nullptr);
+}
+
 // Each resource, the reply section that it needs and the result member
 // that it fills.
 struct Section {
@@ -120,13 +137,12 @@ NetworkKinds AskNetworkKinds(const Json::Value &result)
 }
 
 Sampler::Sampler(uint32_t intervalSeconds, const std::string &stateDirectory, std::function<uint32_t()> upTime)
-    : intervalSeconds_(intervalSeconds), upTime_(std::move(upTime)),
-      indexFile_(stateDirectory + "/" + kIndexFileName)
+    : intervalSeconds_(intervalSeconds), upTime_(std::move(upTime)), stateDirectory_(stateDirectory),
+      indexFile_(IndexPath(stateDirectory))
 {
-    indexFile_.Load(memory_.indexes);
     SampleMemory none;
-    current_ = std::make_shared<const Snapshot>(BuildSnapshot(
-        Json::Value(), NetworkKinds{}, none, intervalSeconds_, 0, std::chrono::steady_clock::now()));
+    std::atomic_store(&current_, std::make_shared<const EncodedSnapshot>(BuildSnapshot(
+        Json::Value(), NetworkKinds{}, none, intervalSeconds_, 0, std::chrono::steady_clock::now())));
 }
 
 Sampler::~Sampler()
@@ -138,18 +154,28 @@ void Sampler::Start()
 {
     if (thread_.joinable())
         return;
+    if (loadedDirectory_ != stateDirectory_) {
+        // Counters remembered under the former indexes mean nothing under the new ones.
+        memory_ = SampleMemory();
+        indexFile_ = IndexFile(IndexPath(stateDirectory_));
+        indexFile_.Load(memory_.indexes);
+        loadedDirectory_ = stateDirectory_;
+    }
     if (pipe2(wakeFds_, O_CLOEXEC | O_NONBLOCK) != 0) {
         syslog(LOG_ERR, "%s:%d Cannot create the wake-up pipe, errno=%d", kUnit, __LINE__, errno);
         wakeFds_[0] = wakeFds_[1] = -1;
     }
     struct sigaction interrupt {};
     interrupt.sa_handler = IgnoreInterrupt;  // no SA_RESTART: waits end with EINTR
-    sigaction(kInterruptSignal, &interrupt, nullptr);
+    sigaction(kInterruptSignal, &interrupt, &previousInterrupt_);
     stopping_ = false;
     running_ = true;
     thread_ = std::thread([this] {
+        KeepOnlyTheInterrupt();
         Run();
+        std::lock_guard<std::mutex> lock(endMutex_);
         running_ = false;
+        ended_.notify_all();
     });
 }
 
@@ -162,11 +188,14 @@ void Sampler::Stop()
     }
     if (thread_.joinable()) {
         // The thread may be about to wait on the collector: repeat until it ends.
+        std::unique_lock<std::mutex> lock(endMutex_);
         while (running_) {
             pthread_kill(thread_.native_handle(), kInterruptSignal);
-            std::this_thread::sleep_for(kInterruptRepeat);
+            ended_.wait_for(lock, kInterruptRepeat, [this] { return !running_; });
         }
+        lock.unlock();
         thread_.join();
+        sigaction(kInterruptSignal, &previousInterrupt_, nullptr);
     }
     for (int &fd : wakeFds_) {
         if (fd >= 0)
@@ -183,12 +212,6 @@ void Sampler::SampleNow()
     }
 }
 
-std::shared_ptr<const Snapshot> Sampler::Current() const
-{
-    std::lock_guard<std::mutex> lock(mutex_);
-    return current_;
-}
-
 void Sampler::Run()
 {
     const int intervalMs = static_cast<int>(std::min<uint64_t>(intervalSeconds_ * 1000ull, INT32_MAX));
@@ -196,7 +219,13 @@ void Sampler::Run()
     while (!stopping_) {
         const auto now = std::chrono::steady_clock::now();
         if (now >= due) {
-            Sample();
+            // Nothing may leave the thread: in snmpd that would end snmpd.
+            try {
+                Sample();
+            } catch (const std::exception &error) {
+                ++failed_;
+                syslog(LOG_ERR, "%s:%d A sample failed: %s", kUnit, __LINE__, error.what());
+            }
             due = std::chrono::steady_clock::now() + std::chrono::milliseconds(intervalMs);
             continue;
         }
@@ -226,13 +255,10 @@ void Sampler::Sample()
     if (collectorAway_)
         syslog(LOG_NOTICE, "%s:%d The collector answers again", kUnit, __LINE__);
     collectorAway_ = false;
-    auto snapshot = std::make_shared<const Snapshot>(
+    auto snapshot = std::make_shared<const EncodedSnapshot>(
         BuildSnapshot(outcome.result, AskNetworkKinds(outcome.result), memory_, intervalSeconds_, upTime_(),
                       std::chrono::steady_clock::now()));
-    {
-        std::lock_guard<std::mutex> lock(mutex_);
-        current_ = std::move(snapshot);
-    }
+    std::atomic_store(&current_, std::shared_ptr<const EncodedSnapshot>(std::move(snapshot)));
     indexFile_.Save(memory_.indexes);
 }
 

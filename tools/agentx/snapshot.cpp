@@ -378,20 +378,6 @@ bool StartsWith(const Oid &oid, const Oid &prefix)
 
 }  // namespace
 
-const Entry *Snapshot::Find(const Oid &oid) const
-{
-    auto found = std::lower_bound(entries.begin(), entries.end(), oid,
-                                  [](const Entry &entry, const Oid &key) { return entry.oid < key; });
-    return found != entries.end() && found->oid == oid ? &*found : nullptr;
-}
-
-const Entry *Snapshot::FindNext(const Oid &oid) const
-{
-    auto found = std::upper_bound(entries.begin(), entries.end(), oid,
-                                  [](const Oid &key, const Entry &entry) { return key < entry.oid; });
-    return found != entries.end() ? &*found : nullptr;
-}
-
 bool IsInstanceOfKnownObject(const Oid &oid)
 {
     // The objects' OIDs below korvObjects without their instance: group.number or table.1.column.

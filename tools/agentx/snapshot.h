@@ -45,14 +45,10 @@ struct Entry {
     Value value;
 };
 
+// Answered through its layout for answering (encoded_snapshot.h).
 struct Snapshot {
     std::vector<Entry> entries;  // ascending OID order, no duplicates
     std::chrono::steady_clock::time_point taken{};
-
-    // The entry at `oid`, or nullptr.
-    const Entry *Find(const Oid &oid) const;
-    // The first entry after `oid` in OID order, or nullptr past the end.
-    const Entry *FindNext(const Oid &oid) const;
 };
 
 // Whether `oid` names an instance of an object that KORVSNMP-MIB defines
