@@ -19,6 +19,8 @@
 
 #include <json/value.h>
 
+#include "exposition/network_kinds.h"
+
 namespace korvagentx {
 
 using Oid = std::vector<uint32_t>;
@@ -61,12 +63,8 @@ struct Snapshot {
 // than noSuchObject.
 bool IsInstanceOfKnownObject(const Oid &oid);
 
-// What the result cannot tell of the "network" rows: which devices are link
-// aggregations, and the PPPoE link's name (a prefix; empty: none).
-struct NetworkKinds {
-    std::set<std::string> aggregations;
-    std::string pppoePrefix;
-};
+// What the result cannot tell of the "network" rows, as the exporter learns it too.
+using korvexposition::NetworkKinds;
 
 // One table's row indexes. A key present in the previous Assign keeps its
 // index; a new key gets the next unused one (from 1 up, never reused); keys

@@ -5,12 +5,14 @@
 
 #include <chrono>
 #include <iostream>
+#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "atomic_file.h"
+#include "exposition/exposition.h"
 #include "korvsnmp/korvsnmp.h"
-#include "openmetrics_format.h"
 #include "options.h"
 #include "protocol/collector_protocol.h"
 #include "table_format.h"
@@ -38,20 +40,21 @@ Json::Value BuildRequest(const std::vector<std::string> &resources)
     return request;
 }
 
-void Print(const Json::Value &result, const korvstat::Options &options)
+void Print(const Json::Value &result, const korvstat::Options &options, std::ostream &out)
 {
     switch (options.format) {
     case korvstat::Format::Table:
-        korvstat::WriteTables(result, options.rawNumbers, std::cout);
+        korvstat::WriteTables(result, options.rawNumbers, out);
         break;
     case korvstat::Format::OpenMetrics:
-        korvstat::WriteOpenMetrics(result, std::cout);
+        korvexposition::WriteOpenMetrics(
+            korvexposition::BuildExposition(result, korvexposition::AskNetworkKinds(result)), out);
         break;
     case korvstat::Format::CompactJson:
-        std::cout << korvproto::CompactJson(result) << '\n';
+        out << korvproto::CompactJson(result) << '\n';
         break;
     case korvstat::Format::PrettyJson:
-        std::cout << result.toStyledString();
+        out << result.toStyledString();
         break;
     }
 }
@@ -69,14 +72,20 @@ int Statistics(const korvstat::Options &options)
     Json::Value result(Json::objectValue);
     if (!SNMPParseReplyData(request, std::move(reply), result))
         return Fail("the collector's reply could not be assembled into statistics");
-    Print(result, options);
-    return 0;
+    if (options.outputPath.empty()) {
+        Print(result, options, std::cout);
+        return 0;
+    }
+    std::ostringstream text;
+    Print(result, options, text);
+    std::string error;
+    return korvstat::ReplaceFile(options.outputPath, text.str(), error) ? 0 : Fail(error);
 }
 
 // Statistics every --watch seconds, each on a cleared terminal.
 int WatchStatistics(const korvstat::Options &options)
 {
-    const bool terminal = isatty(STDOUT_FILENO) == 1;
+    const bool terminal = isatty(STDOUT_FILENO) == 1 && options.outputPath.empty();
     const auto interval = std::chrono::milliseconds(static_cast<long>(options.watchSeconds * 1000));
     return korvstat::Watch(
         interval, options.watchCount,

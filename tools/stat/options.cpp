@@ -15,7 +15,7 @@ namespace korvstat {
 
 const std::string kUsage =
     std::string("Usage: korvsnmp-stat [--resource LIST] [--format json|table|openmetrics]\n"
-    "                     [--compact] [--bytes] [--watch SECONDS]\n"
+    "                     [--compact] [--bytes] [--watch SECONDS] [--output FILE]\n"
     "       korvsnmp-stat --reload\n"
     "       korvsnmp-stat --history-mode REASON\n"
     "       korvsnmp-stat --help | --version\n"
@@ -31,6 +31,8 @@ const std::string kUsage =
     "  --compact              JSON on one line (with --format json only)\n"
     "  --bytes                exact numbers in tables instead of 1.5M (table only)\n"
     "  --watch SECONDS        redraw every SECONDS (0.1 to 86400) until interrupted\n"
+    "  --output FILE          replace FILE with the output, atomically (a file\n"
+    "                         beside it, then renamed), instead of standard output\n"
     "  --reload               make the collector reload, instead of asking statistics\n"
     "  --history-mode REASON  put the collector into history mode, with REASON\n"
     "  -h, --help             this text\n"
@@ -61,6 +63,7 @@ enum LongOnly : int {
     kBytes,
     kWatch,
     kWatchCount,
+    kOutput,
     kReload,
     kHistoryMode,
 };
@@ -72,6 +75,7 @@ const option kLongOptions[] = {
     {"bytes", no_argument, nullptr, kBytes},
     {"watch", required_argument, nullptr, kWatch},
     {"watch-count", required_argument, nullptr, kWatchCount},  // for tests; not in the usage
+    {"output", required_argument, nullptr, kOutput},
     {"reload", no_argument, nullptr, kReload},
     {"history-mode", required_argument, nullptr, kHistoryMode},
     {"help", no_argument, nullptr, 'h'},
@@ -82,7 +86,7 @@ const option kLongOptions[] = {
 constexpr char kShortOptions[] = "+:hV";
 
 // Options that only a statistics request takes.
-constexpr int kStatisticsOptions[] = {kResource, kFormat, kCompact, kBytes, kWatch, kWatchCount};
+constexpr int kStatisticsOptions[] = {kResource, kFormat, kCompact, kBytes, kWatch, kWatchCount, kOutput};
 // Options that choose another action; at most one per command line.
 constexpr int kActionOptions[] = {kReload, kHistoryMode, 'h', 'V'};
 
@@ -263,6 +267,13 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
         case kWatch:
             if (!ParseWatchSeconds(value, options.watchSeconds, error))
                 return false;
+            break;
+        case kOutput:
+            options.outputPath = value;
+            if (value.empty() || value.back() == '/') {
+                error = "--output needs a file name, not \"" + value + "\"";
+                return false;
+            }
             break;
         case kWatchCount:
             if (!ParseCount(value, options.watchCount, error))

@@ -1,0 +1,80 @@
+// The exporter's heart: a thread samples the collector every interval and
+// keeps the latest result as ready metric families; a scrape takes them
+// without ever waiting on the collector, plus the snapshot's age, the
+// failed samples and whether the last sample reached the collector.
+#ifndef KORVSNMP_EXPORTER_SNAPSHOT_EXPORTER_H
+#define KORVSNMP_EXPORTER_SNAPSHOT_EXPORTER_H
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <thread>
+#include <vector>
+
+#include <json/value.h>
+#include <prometheus/collectable.h>
+#include <prometheus/metric_family.h>
+
+#include "exposition/exposition.h"
+
+namespace korvexporter {
+
+// The families of `exposition` as prometheus-cpp serves them: a counter's
+// name with its samples' "_total".
+std::vector<prometheus::MetricFamily> ToMetricFamilies(const korvexposition::Exposition &exposition);
+
+class SnapshotExporter : public prometheus::Collectable {
+public:
+    // Fills `result` with one sample of the statistics; false when the
+    // collector gave none. Called on the sampling thread only.
+    using SampleFunction = std::function<bool(Json::Value &result, korvexposition::NetworkKinds &kinds)>;
+    using Clock = std::function<std::chrono::steady_clock::time_point()>;
+
+    SnapshotExporter(std::chrono::seconds interval, SampleFunction sample,
+                     Clock now = std::chrono::steady_clock::now);
+    ~SnapshotExporter() override;  // stops the thread
+    SnapshotExporter(const SnapshotExporter &) = delete;
+    SnapshotExporter &operator=(const SnapshotExporter &) = delete;
+
+    // Takes one sample on the calling thread: a result replaces the
+    // snapshot, a failure keeps the old one and counts.
+    void SampleOnce();
+    // Samples every interval on a thread of its own, from one interval on.
+    void Start();
+    // Ends the thread, breaking off an exchange with the collector under way
+    // (SIGUSR2 to the thread, whose handler Start installs).
+    void Stop();
+
+    // The snapshot's families, then the sampling's own: the age of the
+    // snapshot (none before the first), failed samples, the interval and
+    // whether the last sample reached the collector. Never waits on a sample.
+    std::vector<prometheus::MetricFamily> Collect() const override;
+
+private:
+    struct Snapshot {
+        std::vector<prometheus::MetricFamily> families;
+        std::chrono::steady_clock::time_point taken;
+    };
+
+    void Run();
+
+    const std::chrono::seconds interval_;
+    const SampleFunction sample_;
+    const Clock now_;
+    std::atomic<uint64_t> failed_{0};
+    std::atomic<bool> collectorUp_{false};
+    mutable std::mutex mutex_;
+    std::shared_ptr<const Snapshot> current_;
+    std::mutex waitMutex_;
+    std::condition_variable wake_;
+    bool stopping_ = false;
+    std::thread thread_;
+};
+
+}  // namespace korvexporter
+
+#endif
