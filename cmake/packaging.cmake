@@ -59,8 +59,9 @@ set(CPACK_COMPONENT_TOOLS_DESCRIPTION
   "NAS appliance statistics from the collector daemon (programs)
 The operators' programs of libkorvsnmp: korvsnmp-stat, which shows the
 appliance's statistics as JSON, tables or OpenMetrics text, the SNMP AgentX
-subagent korvsnmp-agentx with KORVSNMP-MIB, and the reference collector
-daemon korvsnmpcd, with their manual pages and systemd units.")
+subagent korvsnmp-agentx with KORVSNMP-MIB, the Prometheus exporter
+korvsnmp-exporter with alerting rules, and the reference collector daemon
+korvsnmpcd, with their manual pages and systemd units.")
 
 # The installed programs find the libraries in /usr/lib: the packages carry
 # no RPATH (the plain install keeps it, for any --prefix).

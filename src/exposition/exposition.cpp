@@ -141,7 +141,10 @@ std::vector<const Json::Value *> RecordsOf(Section section, const Json::Value &r
     };
     const Json::Value *holder = member(result, korvcatalogue::ResultMemberOf(section));
     switch (section) {
-    case Section::Agent: return {&result};
+    case Section::Agent:
+        if (result.isObject())
+            return {&result};
+        return {};
     case Section::Cpu:
     case Section::Memory:
     case Section::Nfs:
