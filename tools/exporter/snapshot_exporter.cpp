@@ -49,7 +49,7 @@ std::vector<prometheus::MetricFamily> ToMetricFamilies(const korvexposition::Exp
     return families;
 }
 
-SnapshotExporter::SnapshotExporter(std::chrono::seconds interval, SampleFunction sample, Clock now)
+SnapshotExporter::SnapshotExporter(std::chrono::milliseconds interval, SampleFunction sample, Clock now)
     : interval_(interval), sample_(std::move(sample)), now_(std::move(now))
 {
 }
@@ -123,7 +123,8 @@ std::vector<prometheus::MetricFamily> SnapshotExporter::Collect() const
     }
     korvexposition::FrontEnd frontEnd;
     frontEnd.failedSamples = failed_.load();
-    frontEnd.sampleIntervalSeconds = static_cast<uint32_t>(interval_.count());
+    frontEnd.sampleIntervalSeconds =
+        static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::seconds>(interval_).count());
     frontEnd.collectorUp = collectorUp_.load();
     std::vector<prometheus::MetricFamily> families;
     if (snapshot != nullptr) {

@@ -34,7 +34,7 @@ public:
     using SampleFunction = std::function<bool(Json::Value &result, korvexposition::NetworkKinds &kinds)>;
     using Clock = std::function<std::chrono::steady_clock::time_point()>;
 
-    SnapshotExporter(std::chrono::seconds interval, SampleFunction sample,
+    SnapshotExporter(std::chrono::milliseconds interval, SampleFunction sample,
                      Clock now = std::chrono::steady_clock::now);
     ~SnapshotExporter() override;  // stops the thread
     SnapshotExporter(const SnapshotExporter &) = delete;
@@ -62,7 +62,7 @@ private:
 
     void Run();
 
-    const std::chrono::seconds interval_;
+    const std::chrono::milliseconds interval_;
     const SampleFunction sample_;
     const Clock now_;
     std::atomic<uint64_t> failed_{0};
