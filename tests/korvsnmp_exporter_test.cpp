@@ -13,12 +13,12 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <prometheus/text_serializer.h>
 
 #include "collector_process.h"
 #include "exporter_options.h"
 #include "http_get.h"
 #include "json_text.h"
+#include "metrics_handler.h"
 #include "host_file.h"
 #include "snapshot_exporter.h"
 #include "test_collector.h"
@@ -62,9 +62,7 @@ TEST(KorvsnmpExporterOptions, CommandLines)
 
 std::string Scrape(const SnapshotExporter &exporter)
 {
-    std::ostringstream out;
-    prometheus::TextSerializer().Serialize(out, exporter.Collect());
-    return out.str();
+    return exporter.Render(korvexposition::TextFormat::Classic);
 }
 
 std::vector<std::string> SampleLines(const std::string &text)
@@ -110,6 +108,20 @@ TEST(KorvsnmpExporterSnapshot, ServesTheLastResultWithItsAge)
     EXPECT_THAT(SampleLines(Scrape(exporter)), ElementsAre(served[0], served[1], "korvsnmp_snapshot_age_seconds 30",
         "korvsnmp_failed_samples_total 2", "korvsnmp_sample_interval_seconds 5", "korvsnmp_collector_up 0"));
     EXPECT_THAT(Scrape(exporter), HasSubstr("# TYPE korvsnmp_disk_io_time_seconds_total counter\n"));
+    const std::string openMetrics = exporter.Render(korvexposition::TextFormat::OpenMetrics);
+    EXPECT_THAT(openMetrics, HasSubstr("# TYPE korvsnmp_disk_io_time_seconds counter\n# UNIT "
+                                       "korvsnmp_disk_io_time_seconds seconds\n"));
+    EXPECT_THAT(openMetrics, ::testing::EndsWith("\nkorvsnmp_collector_up 0\n# EOF\n"));
+}
+
+TEST(KorvsnmpExporterSnapshot, TheScraperChoosesTheFormat)
+{
+    const std::pair<const char *, korvexposition::TextFormat> cases[] = {
+        {nullptr, korvexposition::TextFormat::Classic}, {"*/*", korvexposition::TextFormat::Classic},
+        {"text/plain;version=0.0.4", korvexposition::TextFormat::Classic},
+        {"application/openmetrics-text;version=1.0.0,application/openmetrics-text;version=0.0.1;q=0.75,"
+         "text/plain;version=0.0.4;q=0.5,*/*;q=0.1", korvexposition::TextFormat::OpenMetrics}};
+    for (const auto &[accept, format] : cases) EXPECT_EQ(FormatFor(accept), format) << (accept ? accept : "none");
 }
 
 // A stop breaks off a sample that waits on the collector, as the library's
@@ -189,6 +201,20 @@ TEST(KorvsnmpExporterProgram, PrometheusScrapesTheLargeAppliance)
                                        "type=\"internal\"} 0.01\n"));
     const Outcome lint = RunShell("promtool check metrics", scrape.body);
     EXPECT_EQ(std::make_pair(lint.status, lint.output), std::make_pair(0, std::string()));
+    // One formatter: the OpenMetrics scrape is korvsnmp-stat's text, then the sampling's own families.
+    const korvtest::HttpReply openMetrics =
+        korvtest::HttpGet(port, "/metrics", "Accept: application/openmetrics-text;version=1.0.0\r\n");
+    std::vector<std::string> stat = korvtest::RedirectedChildVariables();
+    stat.insert(stat.end(), {std::string(korvstandin::kHostFileVariable) + "=" KORVSNMP_EXAMPLES_DIR
+                             "/large-appliance.host.json", KORVSNMP_STAT_PATH, "--format", "openmetrics"});
+    korvtest::CollectorProcess statRun("/usr/bin/env", stat, socket + ".stat");
+    ASSERT_EQ(statRun.WaitForExit(), 0) << statRun.Log();
+    const std::string statText = statRun.Log();
+    ASSERT_THAT(statText, ::testing::EndsWith("\n# EOF\n"));
+    EXPECT_EQ(openMetrics.body.substr(0, statText.size() - 6), statText.substr(0, statText.size() - 6));
+    EXPECT_THAT(openMetrics.body.substr(statText.size() - 6), ::testing::StartsWith(
+        "# HELP korvsnmp_snapshot_age_seconds "));
+    EXPECT_EQ(korvtest::HttpGet(port, "/other").status, 404);
 
     char directory[] = "/tmp/korvsnmp-prometheus-XXXXXX";
     ASSERT_NE(mkdtemp(directory), nullptr);

@@ -119,7 +119,6 @@ bool ValueOf(const Json::Value &value, const Statistic &statistic, Sample &sampl
     } else {
         return false;
     }
-    sample.value = std::strtod(sample.text.c_str(), nullptr);
     return true;
 }
 
@@ -223,7 +222,7 @@ public:
         for (size_t i = 0; i < records.size(); ++i) {
             const Json::Value *value =
                 records[i]->find(statistic.member.data(), statistic.member.data() + statistic.member.size());
-            Sample sample{labels[i], "", 0};
+            Sample sample{labels[i], ""};
             if (!statistic.metricLabel.empty())
                 sample.labels.push_back(FixedLabel(statistic.metricLabel));
             if (value == nullptr || !ValueOf(*value, statistic, sample))
@@ -239,7 +238,7 @@ public:
     void AddValue(const Statistic &statistic, const Json::Value &value)
     {
         Family &family = FamilyOf(statistic);
-        Sample sample{{}, "", 0};
+        Sample sample{{}, ""};
         if (ValueOf(value, statistic, sample))
             family.samples.push_back(std::move(sample));
     }
@@ -358,22 +357,30 @@ std::string EscapeLabelValue(const std::string &text)
     return escaped;
 }
 
-void WriteOpenMetrics(const Exposition &exposition, std::ostream &out)
+void WriteFamilies(const Exposition &exposition, TextFormat format, std::ostream &out)
 {
+    const bool openMetrics = format == TextFormat::OpenMetrics;
     for (const Family &family : exposition) {
-        out << "# HELP " << family.name << ' ' << family.help << '\n';
-        out << "# TYPE " << family.name << (family.type == FamilyType::Counter ? " counter\n" : " gauge\n");
-        if (!family.unit.empty())
-            out << "# UNIT " << family.name << ' ' << family.unit << '\n';
-        const char *suffix = family.type == FamilyType::Counter ? kTotalSuffix : "";
+        const bool counter = family.type == FamilyType::Counter;
+        const std::string sampleName = counter ? family.name + kTotalSuffix : family.name;
+        const std::string &described = openMetrics ? family.name : sampleName;
+        out << "# HELP " << described << ' ' << family.help << '\n';
+        out << "# TYPE " << described << (counter ? " counter\n" : " gauge\n");
+        if (openMetrics && !family.unit.empty())
+            out << "# UNIT " << described << ' ' << family.unit << '\n';
         for (const Sample &sample : family.samples) {
-            out << family.name << suffix;
+            out << sampleName;
             for (size_t i = 0; i < sample.labels.size(); ++i)
                 out << (i == 0 ? "{" : ",") << sample.labels[i].name << "=\""
                     << EscapeLabelValue(sample.labels[i].value) << '"';
             out << (sample.labels.empty() ? " " : "} ") << sample.text << '\n';
         }
     }
+}
+
+void WriteOpenMetrics(const Exposition &exposition, std::ostream &out)
+{
+    WriteFamilies(exposition, TextFormat::OpenMetrics, out);
     out << "# EOF\n";
 }
 

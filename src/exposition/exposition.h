@@ -25,8 +25,7 @@ struct Label {
 
 struct Sample {
     std::vector<Label> labels;
-    std::string text;  // the value as OpenMetrics writes it: exact where the input is
-    double value;      // the same, as a float
+    std::string text;  // the value as the text formats write it: exact where the input is
 };
 
 struct Family {
@@ -63,8 +62,15 @@ struct FrontEnd {
 };
 Exposition BuildFrontEnd(const FrontEnd &frontEnd);
 
-// The families as OpenMetrics text, each with its HELP, TYPE and UNIT
-// lines, then "# EOF".
+enum class TextFormat {
+    OpenMetrics,  // HELP, TYPE and UNIT lines name the family; a counter's samples add "_total"
+    Classic,      // Prometheus's text format 0.0.4: HELP and TYPE name a counter's "_total", no UNIT
+};
+
+// The families as text, each with its metadata lines, without an end.
+void WriteFamilies(const Exposition &exposition, TextFormat format, std::ostream &out);
+
+// The families as OpenMetrics text, then "# EOF".
 void WriteOpenMetrics(const Exposition &exposition, std::ostream &out);
 
 // `text` escaped for a label value: backslash, double quote and line feed

@@ -26,13 +26,13 @@ sockaddr_in Loopback(int port)
 
 }  // namespace
 
-HttpReply HttpGet(int port, const std::string &target)
+HttpReply HttpGet(int port, const std::string &target, const std::string &headers)
 {
     korvproto::UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
     const sockaddr_in address = Loopback(port);
     if (!fd.Valid() || connect(fd.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0)
         return {};
-    const std::string request = "GET " + target + " HTTP/1.0\r\nHost: 127.0.0.1\r\n\r\n";
+    const std::string request = "GET " + target + " HTTP/1.0\r\nHost: 127.0.0.1\r\n" + headers + "\r\n";
     if (send(fd.Get(), request.data(), request.size(), MSG_NOSIGNAL) != static_cast<ssize_t>(request.size()))
         return {};
     std::string response;

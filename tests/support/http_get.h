@@ -12,9 +12,9 @@ struct HttpReply {
     std::string body;
 };
 
-// GET `target` (path and query) from 127.0.0.1:`port`, read until the
-// server closes.
-HttpReply HttpGet(int port, const std::string &target);
+// GET `target` (path and query) from 127.0.0.1:`port` with `headers`
+// ("Name: value\r\n" each), read until the server closes.
+HttpReply HttpGet(int port, const std::string &target, const std::string &headers = "");
 
 // `text` with every byte but letters, digits and "-._~" percent-encoded.
 std::string UrlEncode(const std::string &text);

@@ -14,6 +14,7 @@
 #include "exporter_options.h"
 #include "exposition/network_kinds.h"
 #include "korvsnmp/korvsnmp.h"
+#include "metrics_handler.h"
 #include "snapshot_exporter.h"
 
 namespace {
@@ -22,7 +23,6 @@ constexpr int kExitFailure = 1;
 constexpr int kExitUsage = 2;
 constexpr char kUnit[] = "korvsnmp-exporter";
 constexpr char kHostName[] = "localhost";
-constexpr char kMetricsPath[] = "/metrics";
 constexpr size_t kServerThreads = 2;
 
 // The library's whole road for one sample of everything.
@@ -57,23 +57,23 @@ int Serve(const korvexporter::Options &options)
     sigaddset(&stop, SIGINT);
     pthread_sigmask(SIG_BLOCK, &stop, nullptr);
 
-    auto exporter = std::make_shared<korvexporter::SnapshotExporter>(
+    auto exporter = std::make_unique<korvexporter::SnapshotExporter>(
         std::chrono::seconds(options.intervalSeconds), TakeSample);
     exporter->SampleOnce();
+    const CivetCallbacks callbacks = korvexporter::MetricsCallbacks(*exporter);
     std::unique_ptr<prometheus::Exposer> exposer;
     try {
-        exposer = std::make_unique<prometheus::Exposer>(options.listen, kServerThreads);
+        exposer = std::make_unique<prometheus::Exposer>(options.listen, kServerThreads, &callbacks);
     } catch (const std::exception &error) {
         syslog(LOG_ERR, "%s:%d Cannot listen on %s: %s", kUnit, __LINE__, options.listen.c_str(), error.what());
         std::cerr << "korvsnmp-exporter: cannot listen on " << options.listen << '\n';
         return kExitFailure;
     }
-    exposer->RegisterCollectable(exporter, kMetricsPath);
     exporter->Start();
     const std::vector<int> ports = exposer->GetListeningPorts();
     const std::string host = options.listen.substr(0, options.listen.rfind(':'));
     syslog(LOG_INFO, "%s:%d Serving http://%s:%d%s", kUnit, __LINE__, host.c_str(), ports.empty() ? 0 : ports[0],
-           kMetricsPath);
+           korvexporter::kMetricsPath);
 
     int signal = 0;
     sigwait(&stop, &signal);

@@ -3,6 +3,7 @@
 #include <pthread.h>
 #include <signal.h>
 
+#include <sstream>
 #include <utility>
 
 namespace korvexporter {
@@ -16,38 +17,19 @@ constexpr auto kInterruptRepeat = std::chrono::milliseconds(50);
 
 void IgnoreInterrupt(int) {}
 
-prometheus::MetricFamily ToMetricFamily(const korvexposition::Family &family)
+// The families in `format`; the `last` of OpenMetrics with its end.
+std::string Text(const korvexposition::Exposition &exposition, korvexposition::TextFormat format,
+                 bool last = false)
 {
-    const bool counter = family.type == korvexposition::FamilyType::Counter;
-    prometheus::MetricFamily converted;
-    converted.name = counter ? family.name + "_total" : family.name;
-    converted.help = family.help;
-    converted.type = counter ? prometheus::MetricType::Counter : prometheus::MetricType::Gauge;
-    converted.metric.reserve(family.samples.size());
-    for (const korvexposition::Sample &sample : family.samples) {
-        prometheus::ClientMetric metric;
-        metric.label.reserve(sample.labels.size());
-        for (const korvexposition::Label &label : sample.labels)
-            metric.label.push_back({label.name, label.value});
-        if (counter)
-            metric.counter.value = sample.value;
-        else
-            metric.gauge.value = sample.value;
-        converted.metric.push_back(std::move(metric));
-    }
-    return converted;
+    std::ostringstream out;
+    if (last && format == korvexposition::TextFormat::OpenMetrics)
+        korvexposition::WriteOpenMetrics(exposition, out);
+    else
+        korvexposition::WriteFamilies(exposition, format, out);
+    return out.str();
 }
 
 }  // namespace
-
-std::vector<prometheus::MetricFamily> ToMetricFamilies(const korvexposition::Exposition &exposition)
-{
-    std::vector<prometheus::MetricFamily> families;
-    families.reserve(exposition.size());
-    for (const korvexposition::Family &family : exposition)
-        families.push_back(ToMetricFamily(family));
-    return families;
-}
 
 SnapshotExporter::SnapshotExporter(std::chrono::milliseconds interval, SampleFunction sample, Clock now)
     : interval_(interval), sample_(std::move(sample)), now_(std::move(now))
@@ -68,8 +50,10 @@ void SnapshotExporter::SampleOnce()
         collectorUp_ = false;
         return;
     }
+    const korvexposition::Exposition exposition = korvexposition::BuildExposition(result, kinds);
     auto snapshot = std::make_shared<Snapshot>();
-    snapshot->families = ToMetricFamilies(korvexposition::BuildExposition(result, kinds));
+    snapshot->openMetrics = Text(exposition, korvexposition::TextFormat::OpenMetrics);
+    snapshot->classic = Text(exposition, korvexposition::TextFormat::Classic);
     snapshot->taken = now_();
     collectorUp_ = true;
     std::lock_guard<std::mutex> lock(mutex_);
@@ -114,7 +98,7 @@ void SnapshotExporter::Run()
     wake_.notify_all();
 }
 
-std::vector<prometheus::MetricFamily> SnapshotExporter::Collect() const
+std::string SnapshotExporter::Render(korvexposition::TextFormat format) const
 {
     std::shared_ptr<const Snapshot> snapshot;
     {
@@ -126,14 +110,13 @@ std::vector<prometheus::MetricFamily> SnapshotExporter::Collect() const
     frontEnd.sampleIntervalSeconds =
         static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::seconds>(interval_).count());
     frontEnd.collectorUp = collectorUp_.load();
-    std::vector<prometheus::MetricFamily> families;
+    const bool openMetrics = format == korvexposition::TextFormat::OpenMetrics;
+    std::string text;
     if (snapshot != nullptr) {
-        families = snapshot->families;
+        text = openMetrics ? snapshot->openMetrics : snapshot->classic;
         frontEnd.snapshotAgeSeconds = std::chrono::duration<double>(now_() - snapshot->taken).count();
     }
-    for (prometheus::MetricFamily &family : ToMetricFamilies(korvexposition::BuildFrontEnd(frontEnd)))
-        families.push_back(std::move(family));
-    return families;
+    return text + Text(korvexposition::BuildFrontEnd(frontEnd), format, true);
 }
 
 }  // namespace korvexporter

@@ -1,7 +1,8 @@
 // The exporter's heart: a thread samples the collector every interval and
-// keeps the latest result as ready metric families; a scrape takes them
-// without ever waiting on the collector, plus the snapshot's age, the
-// failed samples and whether the last sample reached the collector.
+// keeps the latest result as ready text, in both formats; a scrape copies it
+// without ever waiting on the collector, and adds the snapshot's age, the
+// failed samples, the interval and whether the last sample reached the
+// collector.
 #ifndef KORVSNMP_EXPORTER_SNAPSHOT_EXPORTER_H
 #define KORVSNMP_EXPORTER_SNAPSHOT_EXPORTER_H
 
@@ -12,22 +13,16 @@
 #include <functional>
 #include <memory>
 #include <mutex>
+#include <string>
 #include <thread>
-#include <vector>
 
 #include <json/value.h>
-#include <prometheus/collectable.h>
-#include <prometheus/metric_family.h>
 
 #include "exposition/exposition.h"
 
 namespace korvexporter {
 
-// The families of `exposition` as prometheus-cpp serves them: a counter's
-// name with its samples' "_total".
-std::vector<prometheus::MetricFamily> ToMetricFamilies(const korvexposition::Exposition &exposition);
-
-class SnapshotExporter : public prometheus::Collectable {
+class SnapshotExporter {
 public:
     // Fills `result` with one sample of the statistics; false when the
     // collector gave none. Called on the sampling thread only.
@@ -36,7 +31,7 @@ public:
 
     SnapshotExporter(std::chrono::milliseconds interval, SampleFunction sample,
                      Clock now = std::chrono::steady_clock::now);
-    ~SnapshotExporter() override;  // stops the thread
+    ~SnapshotExporter();  // stops the thread
     SnapshotExporter(const SnapshotExporter &) = delete;
     SnapshotExporter &operator=(const SnapshotExporter &) = delete;
 
@@ -49,14 +44,16 @@ public:
     // (SIGUSR2 to the thread, whose handler Start installs).
     void Stop();
 
-    // The snapshot's families, then the sampling's own: the age of the
-    // snapshot (none before the first), failed samples, the interval and
-    // whether the last sample reached the collector. Never waits on a sample.
-    std::vector<prometheus::MetricFamily> Collect() const override;
+    // The snapshot's families in `format`, then the sampling's own: the age
+    // of the snapshot (none before the first), failed samples, the interval
+    // and whether the last sample reached the collector; OpenMetrics ends
+    // with "# EOF". Never waits on a sample.
+    std::string Render(korvexposition::TextFormat format) const;
 
 private:
     struct Snapshot {
-        std::vector<prometheus::MetricFamily> families;
+        std::string openMetrics;  // without its end
+        std::string classic;
         std::chrono::steady_clock::time_point taken;
     };
 
