@@ -213,6 +213,9 @@ std::string CommonWords(const std::vector<const Statistic *> &statistics)
     return text;
 }
 
+// The families in the order of their first statistic; a family gathers the
+// samples of every statistic that names it (the CPU modes), and its help is
+// what their helps say alike.
 class Builder {
 public:
     void Add(const Statistic &statistic, const std::vector<const Json::Value *> &records,
