@@ -60,8 +60,9 @@ set(CPACK_COMPONENT_TOOLS_DESCRIPTION
 The operators' programs of libkorvsnmp: korvsnmp-stat, which shows the
 appliance's statistics as JSON, tables or OpenMetrics text, KORVSNMP-MIB
 served by the SNMP AgentX subagent korvsnmp-agentx or inside snmpd by the
-module korvsnmp-snmpd.so, and the reference collector daemon korvsnmpcd,
-with their manual pages and systemd units.")
+module korvsnmp-snmpd.so, the Prometheus exporter korvsnmp-exporter with
+alerting rules, and the reference collector daemon korvsnmpcd, with their
+manual pages and systemd units.")
 
 # The installed programs find the libraries in /usr/lib: the packages carry
 # no RPATH (the plain install keeps it, for any --prefix).

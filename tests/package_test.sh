@@ -43,6 +43,10 @@ korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-textfile.service
 korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-textfile.timer
 korvsnmp-tools + /usr/share/man/man1/korvsnmp-stat.1.gz
 korvsnmp-tools + /usr/lib/korvsnmp/korvsnmp-snmpd.so
+korvsnmp-tools + /usr/sbin/korvsnmp-exporter
+korvsnmp-tools + /usr/share/man/man8/korvsnmp-exporter.8.gz
+korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-exporter.service
+korvsnmp-tools + /usr/share/korvsnmp/prometheus/korvsnmp.rules.yml
 korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
 LIST
 
@@ -52,6 +56,7 @@ needs libkorvsnmp-dev "libkorvsnmp1 (= $version)"
 needs korvsnmp-tools "libkorvsnmp1 (= $version)"
 needs libkorvsnmp1 libjsoncpp25
 needs korvsnmp-tools libjsoncpp25
+needs korvsnmp-tools libprometheus-cpp-pull
 needs libkorvsnmp-dev libjsoncpp-dev
 
 # lintian: no error and no warning, but for these, with their reasons:

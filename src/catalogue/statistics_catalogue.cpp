@@ -123,7 +123,9 @@ const std::vector<Statistic> &Statistics()
              "korvsnmp_failed_samples", "", "fail", "Samples that failed since the start"},
             {S::Agent, "", K::Gauge, U::Seconds, "korvSampleInterval", 4, X::Unsigned32,
              "korvsnmp_sample_interval_seconds", "", "intv", "Interval between samples"},
-
+            // The exporter's own: SNMP tells the same by korvSnapshotAge.
+            {S::Agent, "", K::Gauge, U::None, "", 0, X::None, "korvsnmp_collector_up", "", "up",
+             "Whether the last sample reached the collector: 1, else 0"},
         };
         AddCpu(all);
         AddDiscontinuity(all, S::Cpu, "korvCpu", 17, false);
@@ -249,6 +251,12 @@ const std::vector<Statistic> &Statistics()
         return all;
     }();
     return statistics;
+}
+
+const Statistic &AgentStatistic(AgentValue value)
+{
+    const std::vector<const Statistic *> agent = StatisticsOf(S::Agent);
+    return *agent.at(static_cast<size_t>(value));
 }
 
 std::vector<const Statistic *> StatisticsOf(Section section)

@@ -93,6 +93,10 @@ std::vector<const Statistic *> StatisticsOf(Section section);
 // The entry for `member` in `section`, or nullptr.
 const Statistic *Find(Section section, const std::string &member);
 
+// The front end's own values (Section::Agent), in the catalogue's order.
+enum class AgentValue { SampleTime, SnapshotAge, FailedSamples, SampleInterval, CollectorUp };
+const Statistic &AgentStatistic(AgentValue value);
+
 // The KORVSNMP-MIB group or table (its number under korvObjects) that holds
 // a section's objects.
 uint32_t SnmpGroupOf(Section section);

@@ -14,8 +14,6 @@
 
 #include <korvsnmp/korvsnmp.h>
 
-#include "korv_net.h"
-
 namespace korvagentx {
 
 namespace {
@@ -23,7 +21,6 @@ namespace {
 constexpr char kUnit[] = "sampler";
 constexpr char kWakeSample = 's';
 constexpr char kWakeStop = 'q';
-constexpr size_t kPppoeNameSize = 16;
 // Sent to the sampling thread on stop: it breaks a wait on the collector
 // (the library's select() fails with EINTR), so a stop never waits 90 s.
 constexpr int kInterruptSignal = SIGUSR2;
@@ -113,27 +110,6 @@ SampleOutcome TakeSample()
             outcome.result[section.member].swapPayload(filled[section.member]);
     }
     return outcome;
-}
-
-NetworkKinds AskNetworkKinds(const Json::Value &result)
-{
-    NetworkKinds kinds;
-    const Json::Value *network = result.isObject() ? result.find("network", "network" + 7) : nullptr;
-    if (network != nullptr && network->isArray()) {
-        for (const Json::Value &record : *network) {
-            if (!record.isObject() || !record.isMember("device") || !record["device"].isString())
-                continue;
-            const std::string device = record["device"].asString();
-            if (KLIBNetOVSIfIsMaster(device.c_str()) == 2)
-                kinds.aggregations.insert(device);
-        }
-    }
-    char pppoe[kPppoeNameSize] = {};
-    if (KORVPPPoeIntfGet(pppoe, sizeof pppoe) == 0) {
-        pppoe[kPppoeNameSize - 1] = '\0';
-        kinds.pppoePrefix = pppoe;
-    }
-    return kinds;
 }
 
 Sampler::Sampler(uint32_t intervalSeconds, const std::string &stateDirectory, std::function<uint32_t()> upTime)

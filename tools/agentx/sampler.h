@@ -41,7 +41,7 @@ struct SampleOutcome {
 SampleOutcome TakeSample();
 
 // The platform's answer to which network devices are aggregations and PPPoE.
-NetworkKinds AskNetworkKinds(const Json::Value &result);
+using korvexposition::AskNetworkKinds;
 
 class Sampler {
 public:

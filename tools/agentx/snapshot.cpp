@@ -97,12 +97,12 @@ DiskType DiskTypeOf(const Json::Value *type)
 
 IfKind IfKindOf(size_t position, const std::string &device, const NetworkKinds &kinds)
 {
-    if (position == 0 && device == "total")
-        return IfKind::Total;
-    if (kinds.aggregations.count(device) != 0)
-        return IfKind::Aggregation;
-    if (!kinds.pppoePrefix.empty() && device.compare(0, kinds.pppoePrefix.size(), kinds.pppoePrefix) == 0)
-        return IfKind::Pppoe;
+    switch (korvexposition::KindOf(position, device, kinds)) {
+    case korvexposition::InterfaceKind::Total: return IfKind::Total;
+    case korvexposition::InterfaceKind::Aggregation: return IfKind::Aggregation;
+    case korvexposition::InterfaceKind::Pppoe: return IfKind::Pppoe;
+    case korvexposition::InterfaceKind::Interface: break;
+    }
     return IfKind::Interface;
 }
 

@@ -16,6 +16,7 @@
 
 #include <json/value.h>
 
+#include "exposition/network_kinds.h"
 #include "row_indexes.h"
 
 namespace korvagentx {
@@ -57,12 +58,8 @@ struct Snapshot {
 // than noSuchObject.
 bool IsInstanceOfKnownObject(const Oid &oid);
 
-// What the result cannot tell of the "network" rows: which devices are link
-// aggregations, and the PPPoE link's name (a prefix; empty: none).
-struct NetworkKinds {
-    std::set<std::string> aggregations;
-    std::string pppoePrefix;
-};
+// What the result cannot tell of the "network" rows, as the exporter learns it too.
+using korvexposition::NetworkKinds;
 
 // What one sample leaves to the next: the tables' row indexes (which the
 // caller may keep in an IndexFile), and for each row and each group of

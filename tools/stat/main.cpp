@@ -10,10 +10,10 @@
 #include <utility>
 #include <vector>
 
+#include "atomic_file.h"
+#include "exposition/exposition.h"
 #include "korvsnmp/korvsnmp.h"
-#include "openmetrics_format.h"
 #include "options.h"
-#include "output_file.h"
 #include "protocol/collector_protocol.h"
 #include "table_format.h"
 #include "watch.h"
@@ -57,7 +57,8 @@ void Print(const Json::Value &result, const korvstat::Options &options, std::ost
         korvstat::WriteTables(result, options.rawNumbers, out);
         break;
     case korvstat::Format::OpenMetrics:
-        korvstat::WriteOpenMetrics(result, out);
+        korvexposition::WriteOpenMetrics(
+            korvexposition::BuildExposition(result, korvexposition::AskNetworkKinds(result)), out);
         break;
     case korvstat::Format::CompactJson:
         out << korvproto::CompactJson(result) << '\n';
@@ -81,27 +82,25 @@ int Statistics(const korvstat::Options &options)
     Json::Value result(Json::objectValue);
     if (!SNMPParseReplyData(request, std::move(reply), result))
         return Fail("the collector's reply could not be assembled into statistics");
-    if (options.output.empty()) {
+    if (options.outputPath.empty()) {
         Print(result, options, std::cout);
         return 0;
     }
     std::ostringstream text;
     Print(result, options, text);
     std::string error;
-    if (!korvstat::ReplaceFile(options.output, text.str(), error))
-        return Fail(error);
-    return 0;
+    return korvstat::ReplaceFile(options.outputPath, text.str(), error) ? 0 : Fail(error);
 }
 
 // Statistics every --watch seconds, each on a cleared terminal.
 int WatchStatistics(const korvstat::Options &options)
 {
-    const bool terminal = isatty(STDOUT_FILENO) == 1;
+    const bool terminal = isatty(STDOUT_FILENO) == 1 && options.outputPath.empty();
     const auto interval = std::chrono::milliseconds(static_cast<long>(options.watchSeconds * 1000));
     return korvstat::Watch(
         interval, options.watchCount,
         [&] {
-            if (terminal && options.output.empty())
+            if (terminal)
                 std::cout << kClearScreen;
             const int status = Statistics(options);
             std::cout << std::flush;

@@ -31,8 +31,8 @@ const std::string kUsage =
     "  --compact              JSON on one line (with --format json only)\n"
     "  --bytes                exact numbers in tables instead of 1.5M (table only)\n"
     "  --watch SECONDS        redraw every SECONDS (0.1 to 86400) until interrupted\n"
-    "  --output FILE          write to FILE, replaced in one step (a temporary file\n"
-    "                         beside it, renamed), instead of standard output\n"
+    "  --output FILE          replace FILE with the output, atomically (a file\n"
+    "                         beside it, then renamed), instead of standard output\n"
     "  --reload               make the collector reload, instead of asking statistics\n"
     "  --history-mode REASON  put the collector into history mode, with REASON\n"
     "  -h, --help             this text\n"
@@ -63,9 +63,9 @@ enum LongOnly : int {
     kBytes,
     kWatch,
     kWatchCount,
+    kOutput,
     kReload,
     kHistoryMode,
-    kOutput,
 };
 
 const option kLongOptions[] = {
@@ -75,9 +75,9 @@ const option kLongOptions[] = {
     {"bytes", no_argument, nullptr, kBytes},
     {"watch", required_argument, nullptr, kWatch},
     {"watch-count", required_argument, nullptr, kWatchCount},  // for tests; not in the usage
+    {"output", required_argument, nullptr, kOutput},
     {"reload", no_argument, nullptr, kReload},
     {"history-mode", required_argument, nullptr, kHistoryMode},
-    {"output", required_argument, nullptr, kOutput},
     {"help", no_argument, nullptr, 'h'},
     {"version", no_argument, nullptr, 'V'},
     {nullptr, 0, nullptr, 0},
@@ -268,16 +268,16 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
             if (!ParseWatchSeconds(value, options.watchSeconds, error))
                 return false;
             break;
+        case kOutput:
+            options.outputPath = value;
+            if (value.empty() || value.back() == '/') {
+                error = "--output needs a file name, not \"" + value + "\"";
+                return false;
+            }
+            break;
         case kWatchCount:
             if (!ParseCount(value, options.watchCount, error))
                 return false;
-            break;
-        case kOutput:
-            options.output = value;
-            if (value.empty()) {
-                error = "--output needs a file name";
-                return false;
-            }
             break;
         }
     }

@@ -3,21 +3,37 @@
 #include <time.h>
 
 #include <algorithm>
-#include <cstdint>
 #include <string>
 #include <vector>
 
+#include "catalogue/statistics_catalogue.h"
 #include "counters.h"
 #include "protocol/collector_protocol.h"
 
 namespace korvstat {
 namespace {
 
+using korvcatalogue::Kind;
+using korvcatalogue::Section;
+using korvcatalogue::Statistic;
+
 constexpr char kMissing[] = "-";
 constexpr char kColumnGap[] = "  ";
 constexpr char kTotal[] = "total";
 
-std::string CellText(const Json::Value &value)
+// The sections that have tables, and where the result holds a list of
+// records (under the member `list` of the section's object, or the section's
+// array itself when `list` is "") and its total.
+struct TableSection {
+    Section section;
+    const char *list;
+};
+constexpr TableSection kTables[] = {{Section::Cpu, nullptr},    {Section::Memory, nullptr},
+                                    {Section::Nfs, nullptr},    {Section::Disk, "disk"},
+                                    {Section::Interface, ""},   {Section::Volume, "volume"},
+                                    {Section::Lun, ""}};
+
+std::string ValueText(const Json::Value &value)
 {
     if (value.isNull())
         return kMissing;
@@ -30,15 +46,6 @@ struct Cell {
     std::string text;
     bool numeric = false;
 };
-
-Cell CounterCell(const Json::Value &value, Unit unit, bool rawNumbers)
-{
-    double shown = 0;
-    if (!ShownValue(value, unit, shown))
-        return {CellText(value), false};
-    const bool bytes = unit == Unit::BytesPerSecond || unit == Unit::KiB;
-    return {bytes && !rawNumbers ? HumanBytes(shown) : ExactText(value, unit), true};
-}
 
 using Row = std::vector<Cell>;
 
@@ -78,105 +85,21 @@ void PrintGrid(const std::string &title, const std::vector<std::string> &header,
     out << '\n';
 }
 
-std::string Header(const Counter &counter)
+bool IsName(const Statistic &statistic)
 {
-    return std::string(counter.member) + " (" + HeaderUnit(counter.unit) + ")";
+    return statistic.kind == Kind::Name || statistic.kind == Kind::Enumeration;
 }
 
-bool IsKnown(const std::string &name, const std::vector<std::string> &names,
-             const std::vector<Counter> &counters)
+// The records of one section's table, a "total" last.
+std::vector<const Json::Value *> RecordsOf(const Json::Value &section, const char *list)
 {
-    return std::find(names.begin(), names.end(), name) != names.end() ||
-           std::any_of(counters.begin(), counters.end(),
-                       [&](const Counter &c) { return name == c.member; });
-}
-
-// A table of records: the `names` columns, every one of `counters`, then the
-// other members that any record has, by name.
-void PrintCounterTable(const std::string &title, const std::vector<const Json::Value *> &records,
-                       const std::vector<std::string> &names, const std::vector<Counter> &counters,
-                       bool rawNumbers, std::ostream &out)
-{
-    if (records.empty()) {
-        out << title << "\n(none)\n\n";
-        return;
-    }
-    std::vector<std::string> others;
-    for (const Json::Value *record : records) {
-        if (!record->isObject())
-            continue;
-        for (const std::string &name : record->getMemberNames())
-            if (!IsKnown(name, names, counters) &&
-                std::find(others.begin(), others.end(), name) == others.end())
-                others.push_back(name);
-    }
-    std::sort(others.begin(), others.end());
-
-    std::vector<std::string> header = names;
-    for (const Counter &counter : counters)
-        header.push_back(Header(counter));
-    header.insert(header.end(), others.begin(), others.end());
-
-    std::vector<Row> rows;
-    for (const Json::Value *record : records) {
-        Row row;
-        if (!record->isObject()) {
-            row.push_back({CellText(*record), false});
-            row.resize(header.size(), Cell{kMissing, false});
-            rows.push_back(std::move(row));
-            continue;
-        }
-        for (const std::string &name : names)
-            row.push_back({CellText((*record)[name]), false});
-        for (const Counter &counter : counters)
-            row.push_back(CounterCell((*record)[counter.member], counter.unit, rawNumbers));
-        for (const std::string &name : others) {
-            const Json::Value &value = (*record)[name];
-            row.push_back({CellText(value), value.isNumeric()});
-        }
-        rows.push_back(std::move(row));
-    }
-    PrintGrid(title, header, rows, out);
-}
-
-// One record shown as one line per member: the known `counters` present,
-// in their order, then the others by name, their values as they are.
-void PrintMemberTable(const std::string &title, const std::string &nameHeader,
-                      const std::string &valueHeader, const Json::Value &record,
-                      const std::vector<Counter> &counters, bool rawNumbers, std::ostream &out)
-{
-    std::vector<Row> rows;
-    if (record.isObject()) {
-        for (const Counter &counter : counters)
-            if (record.isMember(counter.member))
-                rows.push_back({{counter.member, false},
-                                CounterCell(record[counter.member], counter.unit, rawNumbers)});
-        for (const std::string &name : record.getMemberNames())
-            if (!IsKnown(name, {}, counters))
-                rows.push_back({{name, false}, {CellText(record[name]), record[name].isNumeric()}});
-    } else {
-        rows.push_back({{"value", false}, {CellText(record), false}});
-    }
-    PrintGrid(title, {nameHeader, valueHeader}, rows, out);
-}
-
-std::vector<const Json::Value *> Elements(const Json::Value &array)
-{
-    std::vector<const Json::Value *> elements;
+    if (list == nullptr || !(section.isArray() || (section.isObject() && *list != '\0')))
+        return {&section};
+    std::vector<const Json::Value *> rows;
+    const Json::Value &array = section.isObject() ? section[list] : section;
     if (array.isArray())
         for (const Json::Value &element : array)
-            elements.push_back(&element);
-    return elements;
-}
-
-// The records of `section` with the "total" ones last: the member "total" of
-// an object that holds its records under `list`, or the records of an array
-// whose "device" is "total". Another value is one record of its own.
-std::vector<const Json::Value *> TotalLast(const Json::Value &section, const char *list)
-{
-    if (!section.isArray() && !(section.isObject() && *list != '\0'))
-        return {&section};
-    std::vector<const Json::Value *> rows = Elements(section.isObject() ? section[list] : section);
+            rows.push_back(&element);
     std::stable_partition(rows.begin(), rows.end(), [](const Json::Value *record) {
         return !(record->isObject() && (*record)["device"] == kTotal);
     });
@@ -185,18 +108,76 @@ std::vector<const Json::Value *> TotalLast(const Json::Value &section, const cha
     return rows;
 }
 
+// One section's table: its name columns, the statistics that any record
+// has, then the other members of any record, by name.
+void PrintTable(Section section, const std::vector<const Json::Value *> &records, bool rawNumbers,
+                std::ostream &out)
+{
+    const std::string title = korvcatalogue::TitleOf(section);
+    if (records.empty()) {
+        out << title << "\n(none)\n\n";
+        return;
+    }
+    const auto has = [&](const std::string &member) {
+        return std::any_of(records.begin(), records.end(), [&](const Json::Value *record) {
+            return record->isObject() && record->isMember(member);
+        });
+    };
+    std::vector<const Statistic *> columns;
+    for (const Statistic *statistic : korvcatalogue::StatisticsOf(section))
+        if (!statistic->member.empty() && (IsName(*statistic) || has(statistic->member)))
+            columns.push_back(statistic);
+    std::vector<std::string> others;
+    for (const Json::Value *record : records) {
+        if (!record->isObject())
+            continue;
+        for (const std::string &name : record->getMemberNames())
+            if (korvcatalogue::Find(section, name) == nullptr &&
+                std::find(others.begin(), others.end(), name) == others.end())
+                others.push_back(name);
+    }
+    std::sort(others.begin(), others.end());
+
+    std::vector<std::string> header;
+    for (const Statistic *column : columns)
+        header.push_back(column->title);
+    header.insert(header.end(), others.begin(), others.end());
+
+    std::vector<Row> rows;
+    for (const Json::Value *record : records) {
+        Row row;
+        if (!record->isObject()) {
+            row.push_back({ValueText(*record), false});
+            row.resize(header.size(), Cell{kMissing, false});
+            rows.push_back(std::move(row));
+            continue;
+        }
+        for (const Statistic *column : columns) {
+            const Json::Value &value = (*record)[column->member];
+            const std::string shown = IsName(*column) ? "" : CellText(value, *column, rawNumbers);
+            row.push_back(shown.empty() ? Cell{ValueText(value), false} : Cell{shown, true});
+        }
+        for (const std::string &name : others) {
+            const Json::Value &value = (*record)[name];
+            row.push_back({ValueText(value), value.isNumeric()});
+        }
+        rows.push_back(std::move(row));
+    }
+    PrintGrid(title, header, rows, out);
+}
+
 // Seconds since the epoch as local ISO 8601 with the offset from UTC:
 // 2026-11-23T21:04:05+01:00. Other values as they are.
 std::string LocalTime(const Json::Value &time)
 {
     if (!time.isIntegral() || !time.isInt64())
-        return CellText(time);
+        return ValueText(time);
     const time_t seconds = static_cast<time_t>(time.asInt64());
     struct tm local {};
     char text[64];
     if (localtime_r(&seconds, &local) == nullptr ||
         strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%S%z", &local) == 0)
-        return CellText(time);
+        return ValueText(time);
     std::string iso = text;
     iso.insert(iso.size() - 2, ":");  // +0100 -> +01:00
     return iso;
@@ -207,31 +188,16 @@ std::string LocalTime(const Json::Value &time)
 void WriteTables(const Json::Value &result, bool rawNumbers, std::ostream &out)
 {
     if (!result.isObject()) {
-        out << CellText(result) << '\n';
+        out << ValueText(result) << '\n';
         return;
     }
-    if (result.isMember("time"))
-        out << "Sample time" << kColumnGap << LocalTime(result["time"]) << "\n\n";
-    if (result.isMember("cpu"))
-        PrintMemberTable("CPU", "state", "share (%)", result["cpu"], CpuCounters(), rawNumbers, out);
-    if (result.isMember("memory"))
-        PrintMemberTable("Memory", "member", "size (B)", result["memory"], MemoryCounters(),
-                         rawNumbers, out);
-    if (result.isMember("network"))
-        PrintCounterTable("Network interfaces", TotalLast(result["network"], ""), {"device"},
-                          NetworkCounters(), rawNumbers, out);
-    if (result.isMember("disk"))
-        PrintCounterTable("Disks", TotalLast(result["disk"], "disk"),
-                          {"device", "display_name", "type"}, DeviceCounters(), rawNumbers, out);
-    if (result.isMember("space"))
-        PrintCounterTable("Volumes", TotalLast(result["space"], "volume"),
-                          {"device", "display_name"}, DeviceCounters(), rawNumbers, out);
-    if (result.isMember("lun"))
-        PrintCounterTable("iSCSI LUNs", Elements(result["lun"]), {"uuid", "lun_name"},
-                          DeviceCounters(), rawNumbers, out);
-    if (result.isMember("nfs")) {
-        const Json::Value &nfs = result["nfs"];
-        PrintCounterTable("NFS", {&nfs}, {}, NfsCounters(), rawNumbers, out);
+    const std::string &time = korvcatalogue::AgentStatistic(korvcatalogue::AgentValue::SampleTime).member;
+    if (result.isMember(time))
+        out << "Sample time" << kColumnGap << LocalTime(result[time]) << "\n\n";
+    for (const TableSection &table : kTables) {
+        const char *member = korvcatalogue::ResultMemberOf(table.section);
+        if (result.isMember(member))
+            PrintTable(table.section, RecordsOf(result[member], table.list), rawNumbers, out);
     }
 }
 

@@ -9,7 +9,7 @@
 
 #include <gtest/gtest.h>
 
-#include "output_file.h"
+#include "atomic_file.h"
 
 namespace {
 
@@ -19,7 +19,7 @@ std::string Read(const std::string &path)
     return {std::istreambuf_iterator<char>(in), {}};
 }
 
-class OutputFile : public ::testing::Test {
+class AtomicFile : public ::testing::Test {
 protected:
     void SetUp() override { std::filesystem::create_directory(directory_); }
     void TearDown() override { std::filesystem::remove_all(directory_); }
@@ -34,7 +34,7 @@ protected:
     const std::string path_ = directory_ + "/korvsnmp.prom";
 };
 
-TEST_F(OutputFile, ReplacesTheFileInOneStepWhileAReaderKeepsTheOldOne)
+TEST_F(AtomicFile, ReplacesTheFileInOneStepWhileAReaderKeepsTheOldOne)
 {
     std::string error;
     ASSERT_TRUE(korvstat::ReplaceFile(path_, "old\n", error)) << error;
@@ -48,14 +48,14 @@ TEST_F(OutputFile, ReplacesTheFileInOneStepWhileAReaderKeepsTheOldOne)
     EXPECT_EQ(Entries(), 1u);  // no temporary file left beside it
 }
 
-TEST_F(OutputFile, FailureSaysWhatAndLeavesNothing)
+TEST_F(AtomicFile, FailureSaysWhatAndLeavesNothing)
 {
     std::string error;
     EXPECT_FALSE(korvstat::ReplaceFile(directory_ + "/missing/korvsnmp.prom", "x", error));
     EXPECT_EQ(error, "cannot create a file beside " + directory_ + "/missing/korvsnmp.prom: No such file or directory");
     std::filesystem::create_directory(path_);  // a directory cannot be replaced by a file
     EXPECT_FALSE(korvstat::ReplaceFile(path_, "x", error));
-    EXPECT_EQ(error.rfind("cannot rename " + path_ + ".", 0), 0u) << error;
+    EXPECT_EQ(error.rfind("cannot rename " + directory_ + "/.korvsnmp.prom.", 0), 0u) << error;
     EXPECT_NE(error.find(" to " + path_ + ": Is a directory"), std::string::npos) << error;
     EXPECT_EQ(Entries(), 1u);
 }
