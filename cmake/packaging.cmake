@@ -54,6 +54,10 @@ platform, a pkg-config file and a CMake package (korvsnmp::korvsnmp).")
 
 set(CPACK_DEBIAN_TOOLS_PACKAGE_NAME korvsnmp-tools)
 set(CPACK_DEBIAN_TOOLS_PACKAGE_SECTION admin)
+# The snmpd module lies under /usr/lib, where CPack would call ldconfig from
+# scripts of its own; these say there is nothing to do.
+set(CPACK_DEBIAN_TOOLS_PACKAGE_CONTROL_EXTRA ${CMAKE_CURRENT_LIST_DIR}/debian/tools/postinst
+  ${CMAKE_CURRENT_LIST_DIR}/debian/tools/postrm)
 set(CPACK_COMPONENT_TOOLS_DEPENDS library)
 set(CPACK_COMPONENT_TOOLS_DESCRIPTION
   "NAS appliance statistics from the collector daemon (programs)

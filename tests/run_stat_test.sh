@@ -29,7 +29,7 @@ out=$(mktemp -d /tmp/run_stat_test.XXXXXX)
 
 "$top/run_stat.sh" --simulate --format table >"$out/table" 2>"$out/table.err" ||
     fail "run_stat.sh --simulate: $(cat "$out/table.err")"
-volumes=$(sed -n '/^Volumes$/,/^$/p' "$out/table" | awk 'NR > 2 && $2 ~ /^volume[0-9]+$/ { print $2 }' | sort -u | wc -l)
+volumes=$(sed -n '/^Volume$/,/^$/p' "$out/table" | awk 'NR > 2 && $2 ~ /^volume[0-9]+$/ { print $2 }' | sort -u | wc -l)
 [ "$volumes" -eq 64 ] || fail "$volumes volumes named, not 64: $(cat "$out/table" "$out/table.err")"
 grep -q '^==> simulated appliance' "$out/table.err" || fail "no ==> line on stderr: $(cat "$out/table.err")"
 ! grep -q '^==>' "$out/table" || fail "==> lines on stdout"
