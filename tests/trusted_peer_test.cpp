@@ -26,6 +26,7 @@
 #include "korvsnmp/transmitor.h"
 #include "protocol/collector_protocol.h"
 #include "protocol/unique_fd.h"
+#include "reply.h"
 #include "syslog_capture.h"
 #include "test_collector.h"
 
@@ -81,6 +82,34 @@ std::set<std::string> Entries(const std::string &directory)
     for (const auto &entry : std::filesystem::directory_iterator(directory))
         names.insert(entry.path().filename().string());
     return names;
+}
+
+// Whether a request steers the collector decides only for control requests;
+// a refused one is not carried out, so nothing of it is logged here (the
+// server logs the refusal with the client's uid).
+TEST(CollectorControl, RefusedToThoseWhoMayNotSteer)
+{
+    using korvsnmpcd::RequestKind;
+    const struct {
+        const char *body;
+        bool mayControl;
+        RequestKind kind;
+    } cases[] = {
+        {R"({"request":"reload"})", false, RequestKind::kForbiddenControl},
+        {R"({"reason":"x","request":"history_mode"})", false, RequestKind::kForbiddenControl},
+        {R"({"resource":["all"]})", false, RequestKind::kStatistics},
+        {R"({"request":"other"})", false, RequestKind::kStatistics},
+        {"[1]", false, RequestKind::kNotAnObject},
+        {R"({"request":"reload"})", true, RequestKind::kControl},
+    };
+    korvtest::ClearLog();
+    for (const auto &c : cases)
+        EXPECT_EQ(korvsnmpcd::ReadRequest(c.body, c.mayControl), c.kind) << c.body << c.mayControl;
+    EXPECT_THAT(korvtest::LoggedMessages(),
+                ElementsAre(Logged(LOG_NOTICE, "reply",
+                                   "Reload requested; nothing to reload, sampling goes on")));
+    EXPECT_EQ(korvsnmpcd::ControlReply(RequestKind::kForbiddenControl),
+              R"({"error":"control requests need root or the collector's own user","success":false})");
 }
 
 class ForeignPeer : public ::testing::Test {
