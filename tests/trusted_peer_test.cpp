@@ -1,7 +1,9 @@
 // Whom the library believes to be the collector, how the collector takes its
 // path back from another user, and who may steer it: real processes of uid
 // 65534 (nobody) beside a test program that runs as root.
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -179,6 +181,25 @@ TEST_F(ForeignPeer, LibraryBelievesNoListenerOfAnotherUser)
     EXPECT_EQ(korvtest::OpenDescriptorCount(), descriptors);
     // Four connections, not one byte sent on any of them.
     EXPECT_THAT(squatter.Received(4), ElementsAre(0u, 0u, 0u, 0u));
+}
+
+// A caller of another user than root believes a collector of its own user
+// (and, as every other test shows, root's).
+TEST_F(ForeignPeer, LibraryOfAnotherUserBelievesACollectorOfItsOwnUser)
+{
+    const RedirectTo redirect(path_);
+    const std::string path = path_;
+    korvtest::AsNobody caller([path] {
+        const korvproto::UniqueFd listener(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+        const sockaddr_un address = korvtest::SocketAddress(path);
+        if (bind(listener.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0 ||
+            listen(listener.Get(), 1) != 0)
+            return std::string("cannot listen");
+        // The connection is made, and judged, before anyone accepts it.
+        const korvproto::UniqueFd connection(SocketInit());
+        return std::string(connection.Valid() ? "believed" : "refused");
+    });
+    EXPECT_EQ(caller.Result(), std::optional<std::string>("believed"));
 }
 
 // What another user may leave at the collector's path, all replaced.
