@@ -220,6 +220,10 @@ TEST(KorvsnmpcdCounters, LunsComeAndGoWithTheTargetsDevices)
     EXPECT_EQ(luns[0]["device"], "second-uuid");
     EXPECT_EQ(luns[0]["write_mbyte_total"].asUInt64(), 3u);
     EXPECT_EQ(luns[0]["write_byte"].asUInt64(), 0u);  // new: no rate yet
+
+    host.luns.clear();
+    host.Write();
+    EXPECT_EQ(on.Sample()["iSCSI"], Json::Value(Json::arrayValue));
 }
 
 TEST(KorvsnmpcdCounters, AnUnreadableFieldLeavesItsCounterOutLoggedOnce)
