@@ -19,6 +19,9 @@
 #include "catalogue/statistics_catalogue.h"
 #include "collector_process.h"
 #include "fixture_host.h"
+#include "korv_standin.h"
+#include "korvsnmp/parse_data.h"
+#include "platform_test.h"
 #include "protocol/lio_target.h"
 #include "sampler.h"
 #include "syslog_capture.h"
@@ -217,6 +220,10 @@ TEST(KorvsnmpcdCounters, LunsComeAndGoWithTheTargetsDevices)
     EXPECT_EQ(luns[0]["device"], "second-uuid");
     EXPECT_EQ(luns[0]["write_mbyte_total"].asUInt64(), 3u);
     EXPECT_EQ(luns[0]["write_byte"].asUInt64(), 0u);  // new: no rate yet
+
+    host.luns.clear();
+    host.Write();
+    EXPECT_EQ(on.Sample()["iSCSI"], Json::Value(Json::arrayValue));
 }
 
 TEST(KorvsnmpcdCounters, AnUnreadableFieldLeavesItsCounterOutLoggedOnce)
@@ -255,10 +262,12 @@ TEST(KorvsnmpcdCounters, AnUnreadableFieldLeavesItsCounterOutLoggedOnce)
 }
 
 // The built daemon on the fixture's files, sampling every 10 ms: the test
-// waits for the sample that shows the files' new state.
-TEST(KorvsnmpcdCounters, DaemonReportsTheFixtureCountersExactly)
+// waits for the sample that shows the files' new state. The library names
+// its records after the fixture's description of the host.
+TEST(KorvsnmpcdCounters, DaemonReportsTheFixtureCountersExactlyThroughTheLibrary)
 {
     FixtureHost host;
+    const std::string volume = host.MountKernelDevice();
     const std::string socket = host.Root() + "/korvsnmpcd.sock";
     std::vector<std::string> args = {"--foreground", "--socket", socket, "--interval", "0.01"};
     for (const std::string &arg : host.CollectorArguments())
@@ -274,6 +283,25 @@ TEST(KorvsnmpcdCounters, DaemonReportsTheFixtureCountersExactly)
     EXPECT_EQ(Device(data["Network"], "eth0")["rx_byte_total"].asUInt64(), kTwoTo32 + 4000);
     EXPECT_EQ(Device(data["DiskIO"], "sdb")["read_access_total"].asUInt64(), 10u);
     EXPECT_EQ(daemon.Stop(SIGTERM), 0) << daemon.Log();
+
+    korvtest::FreshPlatform();
+    korvstandin::Host() = host.Description();
+    Json::Value reply(Json::objectValue);
+    reply["data"] = data;
+    Json::Value result;
+    ASSERT_TRUE(SNMPParseReplyData(Json::Value(Json::objectValue), reply, result))
+        << ::testing::PrintToString(korvtest::LoggedMessages());
+    EXPECT_EQ(result["disk"]["disk"][1]["display_name"], "Disk 2");
+    EXPECT_EQ(result["disk"]["disk"][1]["read_access_total"].asUInt64(), 10u);
+    EXPECT_EQ(result["network"][1]["rx_byte_total"].asUInt64(), kTwoTo32 + 4000);
+    EXPECT_EQ(result["lun"][0]["lun_name"], "lun_a");
+    EXPECT_EQ(result["lun"][0]["read_mbyte_total"].asUInt64(), 681u);
+    EXPECT_EQ(result["cpu"]["user_ticks_total"].asUInt64(), 1150u);
+    if (!volume.empty()) {
+        EXPECT_EQ(result["space"]["volume"][0]["display_name"], "volume_" + volume);
+        EXPECT_EQ(result["space"]["volume"][0]["write_byte_total"].asUInt64(), 7777u * 512);
+    }
+    EXPECT_EQ(korvstandin::OutstandingAllocations(), 0);
 }
 
 }  // namespace

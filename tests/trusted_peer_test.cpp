@@ -1,7 +1,9 @@
 // Whom the library believes to be the collector, how the collector takes its
 // path back from another user, and who may steer it: real processes of uid
 // 65534 (nobody) beside a test program that runs as root.
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -26,6 +28,7 @@
 #include "korvsnmp/transmitor.h"
 #include "protocol/collector_protocol.h"
 #include "protocol/unique_fd.h"
+#include "reply.h"
 #include "syslog_capture.h"
 #include "test_collector.h"
 
@@ -81,6 +84,34 @@ std::set<std::string> Entries(const std::string &directory)
     for (const auto &entry : std::filesystem::directory_iterator(directory))
         names.insert(entry.path().filename().string());
     return names;
+}
+
+// Whether a request steers the collector decides only for control requests;
+// a refused one is not carried out, so nothing of it is logged here (the
+// server logs the refusal with the client's uid).
+TEST(CollectorControl, RefusedToThoseWhoMayNotSteer)
+{
+    using korvsnmpcd::RequestKind;
+    const struct {
+        const char *body;
+        bool mayControl;
+        RequestKind kind;
+    } cases[] = {
+        {R"({"request":"reload"})", false, RequestKind::kForbiddenControl},
+        {R"({"reason":"x","request":"history_mode"})", false, RequestKind::kForbiddenControl},
+        {R"({"resource":["all"]})", false, RequestKind::kStatistics},
+        {R"({"request":"other"})", false, RequestKind::kStatistics},
+        {"[1]", false, RequestKind::kNotAnObject},
+        {R"({"request":"reload"})", true, RequestKind::kControl},
+    };
+    korvtest::ClearLog();
+    for (const auto &c : cases)
+        EXPECT_EQ(korvsnmpcd::ReadRequest(c.body, c.mayControl), c.kind) << c.body << c.mayControl;
+    EXPECT_THAT(korvtest::LoggedMessages(),
+                ElementsAre(Logged(LOG_NOTICE, "reply",
+                                   "Reload requested; nothing to reload, sampling goes on")));
+    EXPECT_EQ(korvsnmpcd::ControlReply(RequestKind::kForbiddenControl),
+              R"({"error":"control requests need root or the collector's own user","success":false})");
 }
 
 class ForeignPeer : public ::testing::Test {
@@ -150,6 +181,25 @@ TEST_F(ForeignPeer, LibraryBelievesNoListenerOfAnotherUser)
     EXPECT_EQ(korvtest::OpenDescriptorCount(), descriptors);
     // Four connections, not one byte sent on any of them.
     EXPECT_THAT(squatter.Received(4), ElementsAre(0u, 0u, 0u, 0u));
+}
+
+// A caller of another user than root believes a collector of its own user
+// (and, as every other test shows, root's).
+TEST_F(ForeignPeer, LibraryOfAnotherUserBelievesACollectorOfItsOwnUser)
+{
+    const RedirectTo redirect(path_);
+    const std::string path = path_;
+    korvtest::AsNobody caller([path] {
+        const korvproto::UniqueFd listener(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+        const sockaddr_un address = korvtest::SocketAddress(path);
+        if (bind(listener.Get(), reinterpret_cast<const sockaddr *>(&address), sizeof address) != 0 ||
+            listen(listener.Get(), 1) != 0)
+            return std::string("cannot listen");
+        // The connection is made, and judged, before anyone accepts it.
+        const korvproto::UniqueFd connection(SocketInit());
+        return std::string(connection.Valid() ? "believed" : "refused");
+    });
+    EXPECT_EQ(caller.Result(), std::optional<std::string>("believed"));
 }
 
 // What another user may leave at the collector's path, all replaced.

@@ -4,6 +4,7 @@
 #include <sys/sysmacros.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -11,7 +12,9 @@
 
 #include <json/reader.h>
 
+#include "block_nodes.h"
 #include "collector_process.h"
+#include "platform_test.h"
 #include "protocol/collector_protocol.h"
 #include "protocol/lio_target.h"
 
@@ -22,8 +25,9 @@ namespace fs = std::filesystem;
 
 constexpr char kRootTemplate[] = "/tmp/korvfixture-XXXXXX";
 constexpr char kNewSuffix[] = ".new";
-constexpr char kMeminfo[] =
-    "MemTotal:        8041216 kB\nMemFree:         5120000 kB\nMemAvailable:    6144000 kB\n"
+constexpr unsigned int kMemTotalKiB = 8041216;
+constexpr char kMeminfoAfterTotal[] =
+    "MemFree:         5120000 kB\nMemAvailable:    6144000 kB\n"
     "Buffers:          102400 kB\nCached:          1048576 kB\nSwapTotal:       2097148 kB\n"
     "SwapFree:        2000000 kB\n";
 
@@ -91,7 +95,7 @@ void FixtureHost::Write()
         stat << " " << ticks;
     stat << " 0 0\nintr 0\nctxt 0\nbtime 1700000000\n";
     WriteFile("proc/stat", stat.str());
-    WriteFile("proc/meminfo", kMeminfo);
+    WriteFile("proc/meminfo", "MemTotal:        " + std::to_string(kMemTotalKiB) + " kB\n" + kMeminfoAfterTotal);
 
     std::ostringstream netDev;
     netDev << "Inter-|   Receive                            |  Transmit\n"
@@ -173,6 +177,41 @@ bool FixtureHost::Mount(const std::string &name)
     mounted_[name] = node;
     Write();
     return true;
+}
+
+std::string FixtureHost::MountKernelDevice()
+{
+    const std::vector<KernelDevice> devices = KernelDevices();
+    auto unused = std::find_if(devices.begin(), devices.end(),
+                               [this](const KernelDevice &device) { return blocks.count(device.name) == 0; });
+    if (unused == devices.end())
+        return "";
+    const KernelDevice &device = *unused;
+    blocks[device.name] = {device.major, device.minor, false, 7, 77, 777, 7777, 77777};
+    if (Mount(device.name))
+        return device.name;
+    blocks.erase(device.name);
+    return "";
+}
+
+korvstandin::HostDescription FixtureHost::Description() const
+{
+    korvstandin::HostDescription host;
+    DescribeEnglishTexts(host);
+    host.physMemSize = kMemTotalKiB;
+    int bay = 1;
+    for (const auto &[name, block] : blocks)
+        if (block.disk)
+            host.disks.push_back({bay++, DISK_CONTAINER_INTERNAL, 0, "/dev/" + name});
+    for (const auto &[name, counters] : interfaces)
+        if (name != "lo")
+            host.interfaces.push_back({name});
+    for (const auto &[name, node] : mounted_)
+        if (blocks.count(name) > 0)
+            host.spaces.push_back({node, "volume_" + name});
+    for (const auto &[uuid, lun] : luns)
+        host.luns.push_back({Json::Value(uuid), Json::Value(lun.device)});
+    return host;
 }
 
 Json::Value CollectorDataWhen(const std::string &socketPath, const std::function<bool(const Json::Value &)> &ready)

@@ -16,6 +16,8 @@
 
 #include <json/value.h>
 
+#include "korv_standin.h"
+
 namespace korvtest {
 
 // /proc/net/dev: the leading four counters of each direction.
@@ -82,6 +84,18 @@ public:
     // device in "SpaceIO". False when the node cannot be made (mknod needs
     // root); the device is then not mounted.
     bool Mount(const std::string &name);
+
+    // Adds a block device named and numbered as the first of the running
+    // kernel's (/sys/dev/block) that `blocks` does not name yet, with its own counters, and mounts it: the
+    // library's naming of volumes then resolves its node too. Its name, or
+    // "" when the kernel lists none or the node cannot be made.
+    std::string MountKernelDevice();
+
+    // The host as the stand-in platform describes it, for the library's
+    // names: the disks in bays 1, 2... in name order, the interfaces but lo,
+    // the mounted devices as volumes "volume_<name>", each LUN named after
+    // its backstore, and the English texts.
+    korvstandin::HostDescription Description() const;
 
     // The typical host: every counter differs from every other.
     std::array<uint64_t, 8> cpu{};  // user nice system idle iowait irq softirq steal, in ticks

@@ -13,8 +13,11 @@
 namespace korvsnmpcd {
 
 // {"data":{"System":[...],"Memory":[...],"Network":[...],"DiskIO":[...],
-// "SpaceIO":[...],"iSCSI":[],"NFS":{...},"time":N}}; `sample` gives the
-// memory sizes, the sample time and which devices exist.
+// "SpaceIO":[...],"iSCSI":[...],"NFS":{...},"time":N}}: the rates of `rates`,
+// one record per device there, and from `sample` the memory sizes, the
+// sample time and each record's cumulative counters (an empty counter gives
+// no member). Member names come from the catalogue, matched to the values
+// by the catalogue's order of a section's statistics.
 Json::Value StatisticsReply(const Rates &rates, const Snapshot &sample);
 
 // The same, as compact JSON text.
