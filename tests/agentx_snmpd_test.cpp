@@ -3,20 +3,15 @@
 // result for the same reply; the walk answers from the last snapshot while
 // the collector stalls; the collector goes away and comes back; snmpd
 // restarts and the subagent registers again.
-#include <netinet/in.h>
 #include <signal.h>
-#include <sys/socket.h>
 #include <unistd.h>
 
 #include <cctype>
 #include <chrono>
-#include <filesystem>
 #include <fstream>
 #include <map>
-#include <memory>
 #include <optional>
 #include <sstream>
-#include <thread>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -27,46 +22,17 @@
 #include "collector_process.h"
 #include "json_text.h"
 #include "korv_standin.h"
+#include "private_snmpd.h"
 #include "test_collector.h"
 
 namespace {
 
-namespace fs = std::filesystem;
 using Clock = std::chrono::steady_clock;
+using korvtest::PollUntil;
 using korvtest::ReadWholeFile;
 
-constexpr std::chrono::milliseconds kReadyBound{20000}, kPollStep{50};  // generous for the sanitizer build
-constexpr char kSnmpd[] = "/usr/sbin/snmpd";
 const std::vector<std::string> kCounters = {"utilization", "read_access", "read_byte", "write_access", "write_byte"};
 constexpr char kEndOfView[] = " = No more variables left in this MIB View (It is past the end of the MIB tree)\n";
-
-uint16_t FreeUdpPort()
-{
-    int fd = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-    sockaddr_in address{AF_INET, 0, {htonl(INADDR_LOOPBACK)}, {}};
-    socklen_t length = sizeof address;
-    bind(fd, reinterpret_cast<sockaddr *>(&address), sizeof address);
-    getsockname(fd, reinterpret_cast<sockaddr *>(&address), &length);
-    close(fd);
-    return ntohs(address.sin_port);
-}
-
-// Runs a shell command; its standard output and error.
-std::string RunCommand(const std::string &command)
-{
-    std::string output;
-    std::unique_ptr<FILE, int (*)(FILE *)> pipe(popen((command + " 2>&1").c_str(), "r"), pclose);
-    char buffer[4096];
-    for (size_t n; pipe && (n = fread(buffer, 1, sizeof buffer, pipe.get())) > 0;) output.append(buffer, n);
-    return output;
-}
-
-template <typename Predicate> bool PollUntil(Predicate done)
-{
-    for (auto end = Clock::now() + kReadyBound; !done(); std::this_thread::sleep_for(kPollStep))
-        if (Clock::now() >= end) return false;
-    return true;
-}
 
 // How often `part` occurs in `text`.
 std::ptrdiff_t Occurrences(const std::string &text, const std::string &part)
@@ -177,10 +143,7 @@ protected:
         std::string whyNot;
         ASSERT_TRUE(nodes_.Make(2, whyNot)) << whyNot;  // its directory holds everything else too
         std::ofstream(Path("host.json")) << HostDescription(nodes_);
-        ASSERT_EQ(access(kSnmpd, X_OK), 0) << "snmpd is not installed";
-        std::ofstream(Path("snmpd.conf")) << "agentaddress udp:127.0.0.1:" << port_
-            << "\nmaster agentx\nagentXSocket " << Path("agentx.sock") << "\nagentXTimeout 1\nview korvview"
-            << " included .1.3.6.1.3.7947\nrocommunity public 127.0.0.1 -V korvview\n";
+        snmpd_.emplace(nodes_.Directory());
         StartSnmpd();
     }
 
@@ -189,23 +152,13 @@ protected:
     std::string Path(const char *name) const { return nodes_.Directory() + "/" + name; }
 
 
-    void StartSnmpd()
-    {
-        fs::remove(Path("agentx.sock"));  // a killed snmpd leaves it behind
-        snmpd_.reset();  // run through env(1), as the subagent is
-        snmpd_.emplace("/usr/bin/env", std::vector<std::string>{"SNMP_PERSISTENT_DIR=" + Path("state"),
-            kSnmpd, "-f", "-C", "-c", Path("snmpd.conf"), "-M", "", "-m", "", "-Lo"}, Path("snmpd.out"));
-        ASSERT_TRUE(PollUntil([&] { return fs::exists(Path("agentx.sock")); })) << snmpd_->Log();
-    }
+    void StartSnmpd() { ASSERT_TRUE(snmpd_->Start()) << "snmpd did not start: " << snmpd_->Log(); }
 
     // Starts the subagent, which samples at once, and waits for the sample of `time`.
     void StartSubagent(unsigned time)
     {
-        std::vector<std::string> words = korvtest::RedirectedChildVariables();
-        words.insert(words.end(), {"SNMP_PERSISTENT_DIR=" + Path("state"),
-            "KORVPLATFORM_HOST=" + Path("host.json"),
-            KORVSNMP_AGENTX_PATH, "--agentx-socket", Path("agentx.sock"), "--interval", "3600",
-            "--ping-interval", "1", "--persistent-dir", Path("state")});
+        const std::vector<std::string> words = snmpd_->SubagentCommand(KORVSNMP_AGENTX_PATH, Path("host.json"),
+                                                                       {"--interval", "3600", "--ping-interval", "1"});
         subagent_.reset();
         subagent_.emplace("/usr/bin/env", words, Path("agentx.out"));
         ASSERT_TRUE(WaitForSample(time)) << subagent_->Log();
@@ -213,12 +166,7 @@ protected:
 
     // A walk shows each value's type ("Gauge32: 5"), so that a wrong one shows; a get does not.
     std::string Client(const std::string &tool, const std::string &arguments) const
-    {
-        return RunCommand("SNMP_PERSISTENT_DIR=" + Path("client ") + tool +
-                          " -v2c -c public -t 1 -r 0 -M " KORVSNMP_MIB_DIRS " -m KORVSNMP-MIB -Os -Oe -OU " +
-                          (tool.find("walk") == std::string::npos ? "-OQ " : "") + "127.0.0.1:" +
-                          std::to_string(port_) + " " + arguments);
-    }
+    { return snmpd_->Client(KORVSNMP_MIB_DIRS, tool, arguments); }
 
     bool Answers(const std::string &object, const std::string &value) const
     { return PollUntil([&] { return Client("snmpget", object) == object + " = " + value + "\n"; }); }
@@ -262,9 +210,9 @@ protected:
     }
 
     korvtest::BlockNodes nodes_;
-    const uint16_t port_ = FreeUdpPort();
     std::optional<korvtest::TestCollector> collector_{std::in_place};
-    std::optional<korvtest::CollectorProcess> snmpd_, subagent_;  // the subagent declared last: stopped first
+    std::optional<korvtest::PrivateSnmpd> snmpd_;
+    std::optional<korvtest::CollectorProcess> subagent_;  // declared last: stopped first
 };
 
 TEST_F(AgentxUnderSnmpd, EveryObjectIsTheLibrarysResultAndARestartedSnmpdFindsTheSubagentAgain)

@@ -16,6 +16,7 @@ namespace korvstat {
 const std::string kUsage =
     std::string("Usage: korvsnmp-stat [--resource LIST] [--format json|table|openmetrics]\n"
     "                     [--compact] [--bytes] [--watch SECONDS]\n"
+    "       korvsnmp-stat --top [--watch SECONDS]\n"
     "       korvsnmp-stat --reload\n"
     "       korvsnmp-stat --history-mode REASON\n"
     "       korvsnmp-stat --help | --version\n"
@@ -31,6 +32,9 @@ const std::string kUsage =
     "  --compact              JSON on one line (with --format json only)\n"
     "  --bytes                exact numbers in tables instead of 1.5M (table only)\n"
     "  --watch SECONDS        redraw every SECONDS (0.1 to 86400) until interrupted\n"
+    "  --top                  live view of disks, interfaces, volumes and LUNs,\n"
+    "                         busiest first, sampled every --watch SECONDS (2);\n"
+    "                         Tab or 1-4 switch section, < > sort column, q quits\n"
     "  --reload               make the collector reload, instead of asking statistics\n"
     "  --history-mode REASON  put the collector into history mode, with REASON\n"
     "  -h, --help             this text\n"
@@ -63,6 +67,7 @@ enum LongOnly : int {
     kWatchCount,
     kReload,
     kHistoryMode,
+    kTop,
 };
 
 const option kLongOptions[] = {
@@ -74,6 +79,7 @@ const option kLongOptions[] = {
     {"watch-count", required_argument, nullptr, kWatchCount},  // for tests; not in the usage
     {"reload", no_argument, nullptr, kReload},
     {"history-mode", required_argument, nullptr, kHistoryMode},
+    {"top", no_argument, nullptr, kTop},
     {"help", no_argument, nullptr, 'h'},
     {"version", no_argument, nullptr, 'V'},
     {nullptr, 0, nullptr, 0},
@@ -82,7 +88,9 @@ const option kLongOptions[] = {
 constexpr char kShortOptions[] = "+:hV";
 
 // Options that only a statistics request takes.
-constexpr int kStatisticsOptions[] = {kResource, kFormat, kCompact, kBytes, kWatch, kWatchCount};
+constexpr int kStatisticsOptions[] = {kResource, kFormat, kCompact, kBytes, kWatch, kWatchCount, kTop};
+// Options that the live view does not take: it chooses its sections and draws them itself.
+constexpr int kNotWithTop[] = {kResource, kFormat, kCompact, kBytes, kWatchCount};
 // Options that choose another action; at most one per command line.
 constexpr int kActionOptions[] = {kReload, kHistoryMode, 'h', 'V'};
 
@@ -188,6 +196,12 @@ bool CheckCombination(const std::vector<int> &given, const Options &options, std
             return false;
         }
     }
+    for (int code : kNotWithTop) {
+        if (has(kTop) && has(code)) {
+            error = "--top and " + OptionName(code) + " cannot be combined";
+            return false;
+        }
+    }
     if (has(kCompact) && has(kFormat) && options.format != Format::PrettyJson) {
         error = "--compact applies to --format json only";
         return false;
@@ -244,6 +258,7 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
         case kReload: options.action = Action::Reload; break;
         case kCompact: compact = true; break;
         case kBytes: options.rawNumbers = true; break;
+        case kTop: options.top = true; break;
         case kHistoryMode:
             options.action = Action::HistoryMode;
             options.reason = value;

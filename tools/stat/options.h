@@ -18,6 +18,7 @@ struct Options {
     bool rawNumbers = false;     // --bytes: tables show exact counts, not 1.5M
     double watchSeconds = 0;     // --watch: redraw every so many seconds; 0: once
     unsigned watchCount = 0;     // hidden --watch-count: stop after so many draws; 0: never
+    bool top = false;            // --top: the live view, sampling every --watch seconds (default 2)
 };
 
 // The resource names that a request may carry.
