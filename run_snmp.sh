@@ -11,7 +11,7 @@ top=$(pwd)
 port=1161
 
 packages="ca-certificates cmake make g++ pkg-config libjsoncpp-dev libgtest-dev libgmock-dev
-          libbenchmark-dev snmpd snmp smitools libsmi2-common libsnmp-dev"
+          libbenchmark-dev snmpd snmp smitools libsmi2-common libsnmp-dev libncurses-dev"
 missing=
 for package in $packages; do
     dpkg-query -W -f '${Status}' "$package" 2>/dev/null | grep -q 'ok installed' || missing="$missing $package"

@@ -19,7 +19,7 @@ pidfile=$PWD/build/korvsnmpcd.pid
 stat=build/tools/stat/korvsnmp-stat
 collector=build/tools/korvsnmpcd/korvsnmpcd
 packages="ca-certificates cmake make g++ pkg-config libjsoncpp-dev libgtest-dev libgmock-dev libbenchmark-dev
-    libsnmp-dev"
+    libsnmp-dev libncurses-dev"
 
 simulate=
 if [ "${1:-}" = --simulate ]; then

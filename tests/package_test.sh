@@ -40,6 +40,8 @@ korvsnmp-tools + /usr/sbin/korvsnmpcd
 korvsnmp-tools + /usr/share/man/man8/korvsnmpcd.8.gz
 korvsnmp-tools + /usr/lib/systemd/system/korvsnmpcd.service
 korvsnmp-tools + /usr/share/man/man1/korvsnmp-stat.1.gz
+korvsnmp-tools + /usr/share/korvsnmp/snmp_exporter/snmp.yml
+korvsnmp-tools + /usr/share/korvsnmp/snmp_exporter/generator.yml
 korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
 LIST
 
