@@ -16,6 +16,7 @@
 #include "collector_process.h"
 #include "host_file.h"
 #include "json_text.h"
+#include "options.h"
 #include "korv_standin.h"
 #include "korvsnmp/korvsnmp.h"
 #include "platform_test.h"
@@ -115,6 +116,51 @@ std::vector<size_t> LineWidths(const std::vector<std::string> &screen)
     return widths;
 }
 
+// The live view in `tmux`, as the redirected child that reaches this
+// process's private collector path, on the large appliance's host.
+bool StartView(Tmux &tmux, int width, int height)
+{
+    return tmux.Start(korvtest::RedirectedChildPrefix() + std::string(korvstandin::kHostFileVariable) + "=" +
+                          korvtest::ShellQuoted(kHostFile) + " " KORVSNMP_STAT_PATH " --top --watch 0.5",
+                      width, height);
+}
+
+std::string PrivateDirectory()
+{
+    const std::string &socket = korvtest::PrivateCollectorPath();
+    return socket.substr(0, socket.rfind('/'));
+}
+
+TEST(KorvsnmpTopOptions, TopTakesAnIntervalAndNoOutputOptions)
+{
+    korvstat::Options options;
+    std::string error;
+    ASSERT_TRUE(korvstat::ParseOptions({"--top", "--watch=0.5"}, options, error)) << error;
+    EXPECT_TRUE(options.top);
+    EXPECT_EQ(options.watchSeconds, 0.5);
+    const std::pair<std::vector<std::string>, std::string> refused[] = {
+        {{"--top", "--format", "table"}, "--top and --format cannot be combined"},
+        {{"--top", "--resource=disk"}, "--top and --resource cannot be combined"},
+        {{"--bytes", "--top"}, "--top and --bytes cannot be combined"},
+        {{"--top", "--compact"}, "--top and --compact cannot be combined"},
+        {{"--top", "--watch=1", "--watch-count=2"}, "--top and --watch-count cannot be combined"},
+        {{"--top", "--reload"}, "--reload and --top cannot be combined"},
+        {{"--top=yes"}, "--top takes no value"},
+        {{"--top", "--top"}, "--top given more than once"}};
+    for (const auto &[arguments, expected] : refused) {
+        korvstat::Options refusedOptions;
+        EXPECT_FALSE(korvstat::ParseOptions(arguments, refusedOptions, error)) << expected;
+        EXPECT_EQ(error, expected);
+    }
+}
+
+TEST(KorvsnmpTopOptions, WithoutATerminalTheViewSaysSoAndFails)
+{
+    korvtest::CollectorProcess view(KORVSNMP_STAT_PATH, {"--top"}, PrivateDirectory() + "/top.out");
+    EXPECT_EQ(view.WaitForExit(), 1);
+    EXPECT_EQ(view.Log(), "korvsnmp-stat: --top needs a terminal\n");
+}
+
 using KorvsnmpTop = korvtest::PlatformTest;
 
 TEST_F(KorvsnmpTop, FitsTheTerminalShowsTheBusiestDiskFirstFollowsAResizeAndQuitsWithQ)
@@ -138,11 +184,8 @@ TEST_F(KorvsnmpTop, FitsTheTerminalShowsTheBusiestDiskFirstFollowsAResizeAndQuit
                                          socket + ".log");
     ASSERT_TRUE(korvtest::WaitUntilConnectable(socket)) << collector.Log();
 
-    const std::string directory = socket.substr(0, socket.rfind('/'));
-    Tmux tmux(directory);
-    ASSERT_TRUE(tmux.Start(korvtest::RedirectedChildPrefix() + std::string(korvstandin::kHostFileVariable) + "=" +
-                               korvtest::ShellQuoted(kHostFile) + " " KORVSNMP_STAT_PATH " --top --watch 0.5",
-                           80, 24));
+    Tmux tmux(PrivateDirectory());
+    ASSERT_TRUE(StartView(tmux, 80, 24));
 
     const size_t titles = korvstat::top::kTitleLine;
     std::vector<std::string> screen = tmux.ScreenWhere(titles + 1, busiestName + " ");
@@ -173,6 +216,34 @@ TEST_F(KorvsnmpTop, FitsTheTerminalShowsTheBusiestDiskFirstFollowsAResizeAndQuit
     tmux.Keys("q");
     EXPECT_EQ(tmux.Exit(), "0\n");
     EXPECT_EQ(collector.Stop(SIGTERM), 0) << collector.Log();
+}
+
+// The keys answer while the collector holds the sample: the sampler waits, not the view.
+TEST_F(KorvsnmpTop, AStalledCollectorHoldsNeitherTheKeysNorTheExit)
+{
+    korvtest::TestCollector collector;
+    collector.Script({"", false});
+    Tmux tmux(PrivateDirectory());
+    ASSERT_TRUE(StartView(tmux, 80, 24));
+    EXPECT_THAT(tmux.ScreenWhere(0, "waiting for the first sample")[0], HasSubstr("waiting for the first sample"));
+    tmux.Keys("4");
+    const std::vector<std::string> screen = tmux.ScreenWhere(1, "[4 LUNs]");
+    ASSERT_GT(screen.size(), 1u);
+    EXPECT_THAT(screen[1], StartsWith(" 1 Disks  2 Interfaces  3 Volumes [4 LUNs]  rows 0 of 0"));
+    tmux.Keys("q");
+    EXPECT_EQ(tmux.Exit(), "0\n");
+    EXPECT_TRUE(collector.WaitForConnections(1));
+}
+
+TEST_F(KorvsnmpTop, AFailedSampleIsSaidOnTheFirstLine)
+{
+    const korvtest::NoCollector none;
+    Tmux tmux(PrivateDirectory());
+    ASSERT_TRUE(StartView(tmux, 120, 30));
+    const std::string failure = "no statistics from the collector on /tmp/korvsnmpcd.sock (the last sample stays)";
+    EXPECT_THAT(tmux.ScreenWhere(0, "no statistics")[0], StartsWith("korvsnmp-stat --top  -  " + failure));
+    tmux.Keys("q");
+    EXPECT_EQ(tmux.Exit(), "0\n");
 }
 
 }  // namespace

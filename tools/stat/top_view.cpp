@@ -30,7 +30,6 @@ using top::Command;
 constexpr char kResultMember[] = "result";
 constexpr char kErrorMember[] = "error";
 constexpr size_t kReadChunk = 65536;
-constexpr char kEscape = 27;
 
 // The sampler's side: a frame of compact JSON per sample, {"result": ...}
 // or {"error": "..."}, until the pipe closes. Never returns.
@@ -134,7 +133,6 @@ public:
         nonl();
         keypad(stdscr, TRUE);
         nodelay(stdscr, TRUE);
-        set_escdelay(0);
         curs_set(0);
     }
     ~Curses() { endwin(); }
@@ -197,7 +195,7 @@ private:
 bool ToCommand(int key, Command &command)
 {
     switch (key) {
-    case 'q': case 'Q': case kEscape: command = Command::Quit; return true;
+    case 'q': case 'Q': command = Command::Quit; return true;
     case '\t': command = Command::NextView; return true;
     case KEY_BTAB: command = Command::PreviousView; return true;
     case '1': case 'd': command = Command::ShowDisks; return true;
