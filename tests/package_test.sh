@@ -43,6 +43,8 @@ korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-textfile.service
 korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-textfile.timer
 korvsnmp-tools + /usr/share/man/man1/korvsnmp-stat.1.gz
 korvsnmp-tools + /usr/lib/korvsnmp/korvsnmp-snmpd.so
+korvsnmp-tools + /usr/share/korvsnmp/snmp_exporter/snmp.yml
+korvsnmp-tools + /usr/share/korvsnmp/snmp_exporter/generator.yml
 korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
 LIST
 
