@@ -24,7 +24,7 @@ port=${KORVSNMP_SNMP_PORT:-1161}
 build=${KORVSNMP_BUILD:-build}
 
 packages="ca-certificates cmake make g++ pkg-config libjsoncpp-dev libgtest-dev libgmock-dev
-          libbenchmark-dev snmpd snmp smitools libsmi2-common libsnmp-dev prometheus-cpp-dev"
+          libbenchmark-dev snmpd snmp smitools libsmi2-common libsnmp-dev prometheus-cpp-dev libncurses-dev"
 missing=
 for package in $packages; do
     dpkg-query -W -f '${Status}' "$package" 2>/dev/null | grep -q 'ok installed' || missing="$missing $package"

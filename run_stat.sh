@@ -31,7 +31,7 @@ pidfile=${KORVSNMPCD_PIDFILE:-$build/korvsnmpcd.pid}
 stat=$build/tools/stat/korvsnmp-stat
 collector=$build/tools/korvsnmpcd/korvsnmpcd
 packages="ca-certificates cmake make g++ pkg-config libjsoncpp-dev libgtest-dev libgmock-dev libbenchmark-dev
-    libsnmp-dev prometheus-cpp-dev"
+    libsnmp-dev prometheus-cpp-dev libncurses-dev"
 
 say() {
     echo "==> $*" >&2

@@ -11,7 +11,7 @@ $as_root apt-get update -qq
 $as_root env DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends \
     ca-certificates cmake make g++ binutils pkg-config libjsoncpp-dev libgtest-dev libgmock-dev \
     libbenchmark-dev python3-prometheus-client mandoc man-db dpkg-dev file lintian \
-    snmpd snmp smitools libsmi2-common libsnmp-dev prometheus-cpp-dev prometheus systemd >/dev/null
+    snmpd snmp smitools libsmi2-common libsnmp-dev prometheus-cpp-dev prometheus systemd libncurses-dev tmux prometheus-snmp-exporter >/dev/null
 
 jobs=$(nproc 2>/dev/null || echo 2)
 

@@ -47,6 +47,8 @@ korvsnmp-tools + /usr/sbin/korvsnmp-exporter
 korvsnmp-tools + /usr/share/man/man8/korvsnmp-exporter.8.gz
 korvsnmp-tools + /usr/lib/systemd/system/korvsnmp-exporter.service
 korvsnmp-tools + /usr/share/korvsnmp/prometheus/korvsnmp.rules.yml
+korvsnmp-tools + /usr/share/korvsnmp/snmp_exporter/snmp.yml
+korvsnmp-tools + /usr/share/korvsnmp/snmp_exporter/generator.yml
 korvsnmp-tools - /usr/lib/libkorvsnmp.so.1
 LIST
 

@@ -16,6 +16,8 @@
 #include "options.h"
 #include "protocol/collector_protocol.h"
 #include "table_format.h"
+#include "top_layout.h"
+#include "top_view.h"
 #include "watch.h"
 
 namespace {
@@ -24,6 +26,7 @@ constexpr int kExitFailure = 1;
 constexpr int kExitUsage = 2;
 constexpr char kHostName[] = "localhost";
 constexpr char kClearScreen[] = "\033[H\033[2J";
+constexpr double kTopSeconds = 2;  // as top's delay
 
 int Fail(const std::string &what)
 {
@@ -69,27 +72,51 @@ void Print(const Json::Value &result, const korvstat::Options &options, std::ost
     }
 }
 
+// One sample of `resources`: true with `result`, or false with `error`.
+bool Sample(const std::vector<std::string> &resources, Json::Value &result, std::string &error)
+{
+    const Json::Value request = BuildRequest(resources);
+    Transmitor transmitor(kHostName);
+    if (transmitor.Transmit(request) != 0) {
+        error = std::string("no statistics from the collector on ") + korvproto::kCollectorSocketPath;
+        return false;
+    }
+    Json::Value reply;
+    if (transmitor.GetDataJson(reply) != 0) {
+        error = "the collector's reply is not JSON";
+        return false;
+    }
+    result = Json::Value(Json::objectValue);
+    if (!SNMPParseReplyData(request, std::move(reply), result)) {
+        error = "the collector's reply could not be assembled into statistics";
+        return false;
+    }
+    return true;
+}
+
 int Statistics(const korvstat::Options &options)
 {
-    const Json::Value request = BuildRequest(options.resources);
-    Transmitor transmitor(kHostName);
-    if (transmitor.Transmit(request) != 0)
-        return Fail(std::string("no statistics from the collector on ") +
-                    korvproto::kCollectorSocketPath);
-    Json::Value reply;
-    if (transmitor.GetDataJson(reply) != 0)
-        return Fail("the collector's reply is not JSON");
-    Json::Value result(Json::objectValue);
-    if (!SNMPParseReplyData(request, std::move(reply), result))
-        return Fail("the collector's reply could not be assembled into statistics");
+    Json::Value result;
+    std::string error;
+    if (!Sample(options.resources, result, error))
+        return Fail(error);
     if (options.outputPath.empty()) {
         Print(result, options, std::cout);
         return 0;
     }
     std::ostringstream text;
     Print(result, options, text);
-    std::string error;
     return korvstat::ReplaceFile(options.outputPath, text.str(), error) ? 0 : Fail(error);
+}
+
+// The live view, sampling every --watch seconds.
+int Top(const korvstat::Options &options)
+{
+    const double seconds = options.watchSeconds > 0 ? options.watchSeconds : kTopSeconds;
+    return korvstat::RunTop(std::chrono::milliseconds(static_cast<long>(seconds * 1000)),
+                            [](Json::Value &result, std::string &error) {
+                                return Sample(korvstat::top::Resources(), result, error);
+                            });
 }
 
 // Statistics every --watch seconds, each on a cleared terminal.
@@ -142,5 +169,7 @@ int main(int argc, char **argv)
     case korvstat::Action::Statistics:
         break;
     }
+    if (options.top)
+        return Top(options);
     return options.watchSeconds > 0 ? WatchStatistics(options) : Statistics(options);
 }

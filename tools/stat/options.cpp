@@ -16,6 +16,7 @@ namespace korvstat {
 const std::string kUsage =
     std::string("Usage: korvsnmp-stat [--resource LIST] [--format json|table|openmetrics]\n"
     "                     [--compact] [--bytes] [--watch SECONDS] [--output FILE]\n"
+    "       korvsnmp-stat --top [--watch SECONDS]\n"
     "       korvsnmp-stat --reload\n"
     "       korvsnmp-stat --history-mode REASON\n"
     "       korvsnmp-stat --help | --version\n"
@@ -33,6 +34,9 @@ const std::string kUsage =
     "  --watch SECONDS        redraw every SECONDS (0.1 to 86400) until interrupted\n"
     "  --output FILE          replace FILE with the output, atomically (a file\n"
     "                         beside it, then renamed), instead of standard output\n"
+    "  --top                  live view of disks, interfaces, volumes and LUNs,\n"
+    "                         busiest first, sampled every --watch SECONDS (2);\n"
+    "                         Tab or 1-4 switch section, < > sort column, q quits\n"
     "  --reload               make the collector reload, instead of asking statistics\n"
     "  --history-mode REASON  put the collector into history mode, with REASON\n"
     "  -h, --help             this text\n"
@@ -66,6 +70,7 @@ enum LongOnly : int {
     kOutput,
     kReload,
     kHistoryMode,
+    kTop,
 };
 
 const option kLongOptions[] = {
@@ -78,6 +83,7 @@ const option kLongOptions[] = {
     {"output", required_argument, nullptr, kOutput},
     {"reload", no_argument, nullptr, kReload},
     {"history-mode", required_argument, nullptr, kHistoryMode},
+    {"top", no_argument, nullptr, kTop},
     {"help", no_argument, nullptr, 'h'},
     {"version", no_argument, nullptr, 'V'},
     {nullptr, 0, nullptr, 0},
@@ -86,7 +92,10 @@ const option kLongOptions[] = {
 constexpr char kShortOptions[] = "+:hV";
 
 // Options that only a statistics request takes.
-constexpr int kStatisticsOptions[] = {kResource, kFormat, kCompact, kBytes, kWatch, kWatchCount, kOutput};
+constexpr int kStatisticsOptions[] = {kResource, kFormat, kCompact, kBytes, kWatch, kWatchCount,
+                                      kOutput, kTop};
+// Options that the live view does not take: it chooses its sections and draws them itself.
+constexpr int kNotWithTop[] = {kResource, kFormat, kCompact, kBytes, kWatchCount, kOutput};
 // Options that choose another action; at most one per command line.
 constexpr int kActionOptions[] = {kReload, kHistoryMode, 'h', 'V'};
 
@@ -192,6 +201,12 @@ bool CheckCombination(const std::vector<int> &given, const Options &options, std
             return false;
         }
     }
+    for (int code : kNotWithTop) {
+        if (has(kTop) && has(code)) {
+            error = "--top and " + OptionName(code) + " cannot be combined";
+            return false;
+        }
+    }
     if (has(kCompact) && has(kFormat) && options.format != Format::PrettyJson) {
         error = "--compact applies to --format json only";
         return false;
@@ -248,6 +263,7 @@ bool ParseOptions(const std::vector<std::string> &arguments, Options &options, s
         case kReload: options.action = Action::Reload; break;
         case kCompact: compact = true; break;
         case kBytes: options.rawNumbers = true; break;
+        case kTop: options.top = true; break;
         case kHistoryMode:
             options.action = Action::HistoryMode;
             options.reason = value;

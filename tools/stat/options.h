@@ -19,6 +19,7 @@ struct Options {
     double watchSeconds = 0;     // --watch: redraw every so many seconds; 0: once
     unsigned watchCount = 0;     // hidden --watch-count: stop after so many draws; 0: never
     std::string outputPath;      // --output: replace this file with each draw; "": standard output
+    bool top = false;            // --top: the live view, sampling every --watch seconds (default 2)
 };
 
 // The resource names that a request may carry.
