@@ -31,28 +31,49 @@ using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
-auto Fields(const Options &o) {
+auto Fields(const Options &o)
+{
     return std::tie(o.action, o.format, o.resources, o.reason, o.rawNumbers, o.watchSeconds, o.watchCount,
-                    o.outputPath); }
+                    o.outputPath);
+}
 
 TEST(KorvsnmpStatOptions, CommandLinesThatParse)
 {
     const std::pair<std::vector<std::string>, void (*)(Options &)> cases[] = {  // the defaults, changed
-        {{}, [](Options &) {}}, {{"-h"}, [](Options &o) { o.action = Action::Help; }},
-        {{"--resource", "cpu,disk", "--format=table", "--watch=0.5", "--bytes"}, [](Options &o) {
-             o.format = Format::Table, o.resources = {"cpu", "disk"}, o.watchSeconds = 0.5, o.rawNumbers = true;
+        {{}, [](Options &) {}},
+        {{"-h"}, [](Options &o) { o.action = Action::Help; }},
+        {{"--resource", "cpu,disk", "--format=table", "--watch=0.5", "--bytes"},
+         [](Options &o) {
+             o.format = Format::Table;
+             o.resources = {"cpu", "disk"};
+             o.watchSeconds = 0.5;
+             o.rawNumbers = true;
          }},
-        {{"--resource=nfs", "--format", "openmetrics", "--watch", "2", "--watch-count", "3"}, [](Options &o) {
-             o.format = Format::OpenMetrics, o.resources = {"nfs"}, o.watchSeconds = 2, o.watchCount = 3; }},
-        {{"--format=openmetrics", "--output", "/run/k.prom"}, [](Options &o) {
-             o.format = Format::OpenMetrics, o.outputPath = "/run/k.prom"; }},
-        {{"--compact"}, [](Options &o) { o.format = Format::CompactJson; }}, {{"--reload"}, [](Options &o) {
-             o.action = Action::Reload; }}, {{"--version"}, [](Options &o) { o.action = Action::Version; }},
+        {{"--resource=nfs", "--format", "openmetrics", "--watch", "2", "--watch-count", "3"},
+         [](Options &o) {
+             o.format = Format::OpenMetrics;
+             o.resources = {"nfs"};
+             o.watchSeconds = 2;
+             o.watchCount = 3;
+         }},
+        {{"--format=openmetrics", "--output", "/run/k.prom"},
+         [](Options &o) {
+             o.format = Format::OpenMetrics;
+             o.outputPath = "/run/k.prom";
+         }},
+        {{"--compact"}, [](Options &o) { o.format = Format::CompactJson; }},
+        {{"--reload"}, [](Options &o) { o.action = Action::Reload; }},
+        {{"--version"}, [](Options &o) { o.action = Action::Version; }},
         {{"--format", "json", "--compact"}, [](Options &o) { o.format = Format::CompactJson; }},
-        {{"--history-mode", "backup window"}, [](Options &o) {
-             o.action = Action::HistoryMode, o.reason = "backup window"; }}};
+        {{"--history-mode", "backup window"},
+         [](Options &o) {
+             o.action = Action::HistoryMode;
+             o.reason = "backup window";
+         }}};
     for (const auto &[arguments, change] : cases) {
-        Options parsed, expected; std::string error;
+        Options parsed;
+        Options expected;
+        std::string error;
         ASSERT_TRUE(ParseOptions(arguments, parsed, error)) << error;
         change(expected);
         EXPECT_EQ(Fields(parsed), Fields(expected)) << ::testing::PrintToString(arguments);

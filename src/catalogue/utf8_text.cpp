@@ -13,7 +13,9 @@ size_t Utf8SequenceLength(std::string_view text, size_t at)
     const auto byte = [&](size_t i) { return static_cast<unsigned char>(text[i]); };
     const unsigned char lead = byte(at);
     size_t length;
-    unsigned char low = 0x80, high = 0xBF;  // bounds of the second byte
+    // Bounds of the second byte.
+    unsigned char low = 0x80;
+    unsigned char high = 0xBF;
     if (lead < 0x80)
         return 1;
     if (lead >= 0xC2 && lead <= 0xDF) {

@@ -346,7 +346,8 @@ std::string Shorten(const std::string &text, size_t width)
     if (width == 0)
         return "";
     // The byte where character `width - 1` starts.
-    size_t kept = 0, at = 0;
+    size_t kept = 0;
+    size_t at = 0;
     for (; at < text.size(); ++at)
         if ((static_cast<unsigned char>(text[at]) & 0xc0) != 0x80 && kept++ == width - 1)
             break;
