@@ -293,7 +293,7 @@ protected:
         // snmpd is not built with the sanitizers: their runtime must come first for the
         // module, and snmpd's own leaks are known.
         if (Module()) {
-            words.front().insert(words.front().find('=') + 1, KORVSNMP_SANITIZER_RUNTIME " ");
+            words.front().insert(words.front().find('=') + 1, KORVSNMP_SANITIZER_RUNTIME);
             words.push_back("LSAN_OPTIONS=suppressions=" KORVSNMP_SNMPD_LEAKS);
         }
 #endif

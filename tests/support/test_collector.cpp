@@ -48,7 +48,10 @@ std::string gPrivateDirectory;
 // path; the directory goes at exit.
 const bool gRedirected = [] {
     PrivateCollectorPath();
-    return std::atexit([] { unlink(PrivateCollectorPath().c_str()), rmdir(gPrivateDirectory.c_str()); }) == 0;
+    return std::atexit([] {
+        std::error_code ignored;  // the tests' files in it go too
+        std::filesystem::remove_all(gPrivateDirectory, ignored);
+    }) == 0;
 }();
 
 }  // namespace
