@@ -165,7 +165,7 @@ def main():
     parser.add_argument("--agentx", help="the korvsnmp-agentx to measure (the built one)")
     parser.add_argument("--perf", action="store_true")
     options = parser.parse_args()
-    build = options.build
+    build = os.path.abspath(options.build)  # snmpd reads dlmod paths from its own directory
     agentx = options.agentx or os.path.join(build, "tools/agentx/korvsnmp-agentx")
 
     with tempfile.TemporaryDirectory(prefix="korvsnmp-speed.") as scratch:
